@@ -1,0 +1,281 @@
+// The per-thread error record.
+//
+// A thread's record, and every copy handed out, is one malloc'd block: the
+// cu_error_t, its argument array, then all of its texts. One free releases
+// it, and a failed allocation can never leave a half-built record behind.
+#include "cu_internal.h"
+
+#include <cfloat>
+#include <cmath>
+#include <cstdarg>
+#include <cstring>
+#include <new>
+#include <utility>
+
+#include <pthread.h>
+
+namespace kx::cu {
+namespace {
+
+char s_no_memory_text[] = "There is not enough memory to record the error.\n";
+
+// Stands in for a record that could not be allocated; never freed.
+cu_error_t s_no_memory_record = {
+    CU_ERROR_ID_NO_MEMORY, nullptr, nullptr, 0, 0, s_no_memory_text, 0, nullptr,
+};
+
+char s_null_text[] = "(null)";
+
+// The calling thread's record; NULL when no error is set. initial-exec keeps
+// the check on the request path to a single load from the thread pointer.
+[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *t_record = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local bool t_reaper_armed = false;
+
+void release_record(cu_error_t *rec) noexcept {
+    if (rec != &s_no_memory_record)
+        std::free(rec);
+}
+
+// Frees the record of an ending thread. A pthread key does this rather than
+// a thread_local destructor: registering one of those allocates, and glibc
+// aborts the process when that allocation fails.
+void reap_thread_record(void *) noexcept {
+    t_reaper_armed = false;
+    release_record(std::exchange(t_record, nullptr));
+}
+
+bool arm_reaper() noexcept {
+    if (t_reaper_armed)
+        return true;
+    static pthread_key_t key;
+    static const bool have_key = pthread_key_create(&key, reap_thread_record) == 0;
+    // Any non-NULL value makes the key's destructor run at thread exit.
+    if (!have_key || pthread_setspecific(key, &t_reaper_armed) != 0)
+        return false;
+    t_reaper_armed = true;
+    return true;
+}
+
+// Makes rec the thread's record, or the no-memory record when rec could not
+// be built or could not be made to go away with the thread.
+int store_thread_record(cu_error_t *rec) noexcept {
+    int status = 0;
+    if (rec == nullptr || !arm_reaper()) {
+        release_record(rec);
+        rec = &s_no_memory_record; // static: needs no reaping
+        status = CU_ERROR_ID_NO_MEMORY;
+    }
+    release_record(std::exchange(t_record, rec));
+    return status;
+}
+
+bool add_size(std::size_t &total, std::size_t more) noexcept {
+    return !__builtin_add_overflow(total, more, &total);
+}
+
+bool add_text_size(std::size_t &total, const char *text) noexcept {
+    return text == nullptr || add_size(total, std::strlen(text) + 1);
+}
+
+const char *arg_text(const cu_error_arg_t &arg) noexcept {
+    const char *text = arg.cu_arg_value.cu_arg_char_str;
+    return text != nullptr ? text : s_null_text;
+}
+
+constexpr std::size_t kArgsOffset = (sizeof(cu_error_t) + alignof(cu_error_arg_t) - 1) /
+                                    alignof(cu_error_arg_t) * alignof(cu_error_arg_t);
+
+// Bytes a one-block copy of src needs; 0 when that overflows.
+std::size_t record_size(const cu_error_t &src, std::uint32_t arg_cnt) noexcept {
+    std::size_t total = kArgsOffset;
+    std::size_t args_size = 0;
+    if (__builtin_mul_overflow(std::size_t{arg_cnt}, sizeof(cu_error_arg_t), &args_size) ||
+        !add_size(total, args_size) || !add_text_size(total, src.cu_ffdc_id) ||
+        !add_text_size(total, src.cu_msg_cat) || !add_text_size(total, src.cu_msg_default))
+        return 0;
+    for (std::uint32_t i = 0; i < arg_cnt; ++i) {
+        const cu_error_arg_t &arg = src.cu_args[i];
+        if (arg.cu_arg_type == CU_ERROR_ARG_CHAR_STR && !add_text_size(total, arg_text(arg)))
+            return 0;
+    }
+    return total;
+}
+
+// Hands out consecutive text slots of a block sized by record_size.
+class TextArea {
+  public:
+    explicit TextArea(char *start) noexcept : next_(start) {}
+
+    char *copy(const char *text) noexcept {
+        if (text == nullptr)
+            return nullptr;
+        const std::size_t size = std::strlen(text) + 1;
+        char *slot = static_cast<char *>(std::memcpy(next_, text, size));
+        next_ += size;
+        return slot;
+    }
+
+  private:
+    char *next_;
+};
+
+// A deep copy of src in one block, or NULL when memory runs out.
+cu_error_t *clone_record(const cu_error_t &src) noexcept {
+    const std::uint32_t arg_cnt = src.cu_args != nullptr ? src.cu_arg_cnt : 0;
+    const std::size_t size = record_size(src, arg_cnt);
+    if (size == 0)
+        return nullptr;
+    auto *block = static_cast<char *>(std::malloc(size));
+    if (block == nullptr)
+        return nullptr;
+
+    auto *rec = new (block) cu_error_t(src);
+    auto *args = reinterpret_cast<cu_error_arg_t *>(block + kArgsOffset);
+    TextArea texts(block + kArgsOffset + arg_cnt * sizeof(cu_error_arg_t));
+    rec->cu_ffdc_id = texts.copy(src.cu_ffdc_id);
+    rec->cu_msg_cat = texts.copy(src.cu_msg_cat);
+    rec->cu_msg_default = texts.copy(src.cu_msg_default);
+    rec->cu_arg_cnt = arg_cnt;
+    rec->cu_args = arg_cnt != 0 ? args : nullptr;
+    for (std::uint32_t i = 0; i < arg_cnt; ++i) {
+        new (&args[i]) cu_error_arg_t(src.cu_args[i]);
+        if (args[i].cu_arg_type == CU_ERROR_ARG_CHAR_STR)
+            args[i].cu_arg_value.cu_arg_char_str = texts.copy(arg_text(src.cu_args[i]));
+    }
+    return rec;
+}
+
+// The kinds of the arguments a message text takes, numbered 1..count.
+struct ArgKinds {
+    unsigned count = 0;
+    kx_int32_t kind[kMaxArgs] = {};  // CU_ERROR_ARG_INT (0) for skipped numbers
+    bool long_double[kMaxArgs] = {}; // a %Lf-style double, passed as long double
+    bool seen[kMaxArgs] = {};
+};
+
+// A number used with two kinds is read as the first; formatting later copies
+// the mismatched placeholder as it stands.
+ArgKinds collect_arg_kinds(const char *text) noexcept {
+    ArgKinds kinds;
+    if (text == nullptr)
+        return kinds;
+    PlaceholderScanner scanner(text);
+    for (Piece piece; scanner.next(piece);) {
+        if (!piece.is_placeholder)
+            continue;
+        const unsigned index = piece.ph.number - 1;
+        if (!kinds.seen[index]) {
+            kinds.seen[index] = true;
+            kinds.kind[index] = piece.ph.kind;
+            kinds.long_double[index] = piece.ph.length == Length::L;
+        }
+        if (piece.ph.number > kinds.count)
+            kinds.count = piece.ph.number;
+    }
+    return kinds;
+}
+
+// A long double outside the range of double becomes an infinity.
+double to_double(long double value) noexcept {
+    if (value > static_cast<long double>(DBL_MAX))
+        return HUGE_VAL;
+    if (value < -static_cast<long double>(DBL_MAX))
+        return -HUGE_VAL;
+    return static_cast<double>(value);
+}
+
+// Reads one variadic argument of the given kind. Texts are not copied here.
+cu_error_arg_t read_arg(kx_int32_t kind, bool long_double, va_list *ap) noexcept {
+    cu_error_arg_t arg{};
+    arg.cu_arg_type = kind;
+    switch (kind) {
+    case CU_ERROR_ARG_LONG:
+        arg.cu_arg_value.cu_arg_long = va_arg(*ap, long);
+        break;
+    case CU_ERROR_ARG_LONG_LONG:
+        arg.cu_arg_value.cu_arg_long_long = va_arg(*ap, long long);
+        break;
+    case CU_ERROR_ARG_DOUBLE:
+        arg.cu_arg_value.cu_arg_double =
+            long_double ? to_double(va_arg(*ap, long double)) : va_arg(*ap, double);
+        break;
+    case CU_ERROR_ARG_CHAR_STR:
+        arg.cu_arg_value.cu_arg_char_str = va_arg(*ap, char *);
+        break;
+    case CU_ERROR_ARG_VOID_PTR:
+        arg.cu_arg_value.cu_arg_void_ptr = va_arg(*ap, void *);
+        break;
+    default:
+        arg.cu_arg_type = CU_ERROR_ARG_INT;
+        arg.cu_arg_value.cu_arg_int = va_arg(*ap, int);
+        break;
+    }
+    return arg;
+}
+
+} // namespace
+} // namespace kx::cu
+
+using namespace kx::cu;
+
+extern "C" {
+
+CU_EXTERN int cu_set_error_1(kx_int32_t error_id, const char *ffdc_id, const char *msg_cat,
+                             kx_int32_t msg_set, kx_int32_t msg_num, const char *msg_default, ...) {
+    if (error_id == 0) { // id 0 means "no error": nothing to keep
+        cu_set_no_error_1();
+        return 0;
+    }
+    const ArgKinds kinds = collect_arg_kinds(msg_default);
+
+    cu_error_arg_t args[kMaxArgs];
+    va_list ap;
+    va_start(ap, msg_default);
+    for (unsigned i = 0; i < kinds.count; ++i)
+        args[i] = read_arg(kinds.kind[i], kinds.long_double[i], &ap);
+    va_end(ap);
+
+    // A view of the caller's data; clone_record copies everything it names.
+    const cu_error_t view = {
+        error_id,
+        const_cast<char *>(ffdc_id),
+        const_cast<char *>(msg_cat),
+        msg_set,
+        msg_num,
+        const_cast<char *>(msg_default),
+        kinds.count,
+        kinds.count != 0 ? args : nullptr,
+    };
+    return store_thread_record(clone_record(view));
+}
+
+CU_EXTERN int cu_pset_error_1(const cu_error_t *err) {
+    if (err == nullptr || err->cu_error_id == 0) {
+        cu_set_no_error_1();
+        return 0;
+    }
+    return store_thread_record(clone_record(*err));
+}
+
+CU_EXTERN void cu_set_no_error_1(void) {
+    cu_error_t *rec = t_record;
+    if (rec == nullptr) [[likely]]
+        return;
+    t_record = nullptr;
+    release_record(rec);
+}
+
+CU_EXTERN void cu_get_error_1(cu_error_t **err) {
+    if (err == nullptr)
+        return;
+    const cu_error_t *rec = t_record;
+    cu_error_t *copy = rec != nullptr ? clone_record(*rec)
+                                      : static_cast<cu_error_t *>(std::calloc(1, sizeof *copy));
+    *err = copy != nullptr ? copy : &s_no_memory_record;
+}
+
+CU_EXTERN void cu_rel_error_1(cu_error_t *err) {
+    release_record(err);
+}
+
+} // extern "C"
