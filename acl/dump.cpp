@@ -1,0 +1,189 @@
+// The ACL dump: an ACL buffer in readable form on standard error. Every line
+// is a catalogue message, formatted through the thread's error record so
+// that the wording follows the catalogue's translations; the record is
+// cleared after each line.
+#include "dump.h"
+
+#include <cstdio>
+#include <cstring>
+#include <memory>
+
+#include <kx_cu.h>
+
+#include "alloc.h"
+#include "convert.h"
+#include "entries.h"
+#include "report.h"
+
+namespace kxacl {
+
+namespace {
+
+// Error id of the records that carry the dump's own lines.
+inline constexpr kx_int32_t dump_line = 1;
+
+// Longest permission string: one character per bit, and its NUL.
+inline constexpr std::size_t max_perm_text = 33;
+
+enum class trailing_newline : bool { no = false, yes = true };
+
+// Writes the thread's record as text on stream, then releases and clears it.
+void print_record(std::FILE *stream, trailing_newline newline) {
+    cu_error_t *err = nullptr;
+    char *text = nullptr;
+    cu_get_error_1(&err);
+    cu_get_errmsg_1(err, &text);
+    if (text)
+        std::fputs(text, stream);
+    if (newline == trailing_newline::yes)
+        std::fputc('\n', stream);
+    std::fflush(stream);
+    cu_rel_error_1(err);
+    cu_rel_errmsg_1(text);
+    cu_set_no_error_1();
+}
+
+// A failure to read a part of the buffer. It goes where the failure to turn
+// a sub-ACL into entries goes, standard output, so that every structural
+// fault of a dumped buffer shows up in one stream.
+void print_failure() {
+    print_record(stdout, trailing_newline::no);
+}
+
+struct tree_deleter {
+    void operator()(sec_acltree_t tree) const noexcept { sec__free_acltree(tree); }
+};
+using unique_tree = std::unique_ptr<sec_acltree_desc, tree_deleter>;
+
+// The mechanism of a sub-ACL header as a text, read only within its field.
+struct subacl_mech_text {
+    char text[256] = {};
+    explicit subacl_mech_text(const subacl_view &v) {
+        if (v.mech)
+            std::memcpy(text, v.mech, v.mech_length);
+    }
+};
+
+// The lead space of a sub-ACL's entries: its own and one more tab. Empty
+// (and reported) when memory ran out.
+unique_mem<char> entry_leadspace(const char *leadspace) {
+    std::size_t length = std::strlen(leadspace);
+    unique_mem<char> lead(static_cast<char *>(mem_alloc(length + 2)));
+    if (!lead) {
+        no_memory("sec__dump_subacl", length + 2);
+        return lead;
+    }
+    std::memcpy(lead.get(), leadspace, length);
+    lead.get()[length] = '\t';
+    lead.get()[length + 1] = '\0';
+    return lead;
+}
+
+// Sets the record to the line of an entry that could be displayed.
+void report_acle_line(const sec_acle_t acle, const char *mech, const char *id, const char *perms,
+                      const char *leadspace) {
+    char letter = type_letter(acle->type);
+    if (type_has_mech(acle->type))
+        report<MSG_DUMP_ACLE_MECH>(dump_line, leadspace, letter, mech, id, perms);
+    else if (type_has_id(acle->type))
+        report<MSG_DUMP_ACLE_ID>(dump_line, leadspace, letter, id, perms);
+    else
+        report<MSG_DUMP_ACLE>(dump_line, leadspace, letter, perms);
+}
+
+// The number of a sub-ACL's header and mechanism bytes: stepping to the next
+// sub-ACL by a shorter length would read this one's bytes again as a header.
+bool subacl_length_covers_header(const subacl_view &v) {
+    return v.length >= v.first_entry - v.offset;
+}
+
+} // namespace
+
+void sec__dump_acle(sec_acle_t acle, sec_perm_set_t ptplset, const char *leadspace) {
+    if (!acle)
+        return;
+    char *mech = nullptr;
+    char *id = nullptr;
+    kx_int32_t rc = sec_display_acle_id(acle, &mech, &id);
+    unique_mem<char> own_mech(mech), own_id(id);
+    char perms[max_perm_text] = {};
+    if (rc == SEC_S_OK)
+        rc = sec_translate_bitmask(acle->perm, ptplset, perms);
+    // A failure is printed in place of the line, so the entry still shows.
+    if (rc == SEC_S_OK)
+        report_acle_line(acle, mech, id, perms, leadspace);
+    print_record(stderr, trailing_newline::no);
+}
+
+void sec__dump_acltree(sec_acltree_t tree, const char *leadspace) {
+    walk_acltree(tree, [&](sec_acltree_node_s *node) {
+        sec__dump_acle(node->sat_acle, nullptr, leadspace);
+        return SEC_S_OK;
+    });
+}
+
+void sec__dump_subacl(acl_bytes b, const subacl_view &v, const char *leadspace) {
+    subacl_mech_text mech(v);
+    report<MSG_DUMP_SUBACL>(dump_line, leadspace, leadspace, v.length, v.type,
+                            static_cast<const char *>(mech.text), v.count);
+    print_record(stderr, trailing_newline::yes);
+
+    sec_acltree_t built = nullptr;
+    if (sec__subacl_to_acltree(b, v, &built) != SEC_S_OK) {
+        print_failure();
+        return;
+    }
+    unique_tree tree(built);
+    unique_mem<char> lead = entry_leadspace(leadspace);
+    if (!lead) {
+        print_failure();
+        return;
+    }
+    sec__dump_acltree(tree.get(), lead.get());
+}
+
+} // namespace kxacl
+
+using namespace kxacl;
+
+// Reads nothing outside the descriptor's length: a header or sub-ACL that
+// runs past it prints 2650-110 and ends the dump.
+extern "C" ACL_EXTERN void sec__dump_acl(sec_acl_buffer_t acl) noexcept {
+    // A negative length holds no bytes either.
+    if (!acl || acl->length <= 0 || !acl->value)
+        return;
+    acl_bytes b = bytes_of(*acl);
+    if (b.data[layout::at_buffer_type] != layout::buffer_type) {
+        report<MSG_DUMP_INVALID>(dump_line);
+        print_record(stderr, trailing_newline::yes);
+        return;
+    }
+    if (b.size < layout::header_size) {
+        report_corrupt(here(src_acl));
+        print_failure();
+        return;
+    }
+    char length_text[16];
+    std::snprintf(length_text, sizeof length_text, "%d", static_cast<int>(acl->length));
+    unsigned count = subacl_count(b);
+    report<MSG_DUMP_ACL>(dump_line, static_cast<const char *>(length_text),
+                         b.data[layout::at_version], b.data[layout::at_byte_order], count);
+    print_record(stderr, trailing_newline::no);
+
+    std::size_t offset = layout::header_size;
+    for (unsigned i = 0; i < count; ++i) {
+        subacl_view v;
+        if (!read_subacl(b, offset, &v)) {
+            report_corrupt(here(src_acl));
+            print_failure();
+            return;
+        }
+        sec__dump_subacl(b, v, "\t");
+        if (!subacl_length_covers_header(v)) {
+            report_corrupt(here(src_acl));
+            print_failure();
+            return;
+        }
+        offset = v.end();
+    }
+}
