@@ -1,0 +1,179 @@
+// Validation and sub-ACL lookup, and every reader and editor of buffers run
+// against truncated and corrupted bytes.
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "acl_fixtures.h"
+#include "buffer_format.h"
+
+using namespace kxacl;
+using namespace kxtest;
+
+namespace {
+
+// Validates b (in host order) through the exported conversion.
+kx_int32_t verify(const bytes &b) {
+    owned_acl acl(b);
+    return sec_convert_acl_to_host(1, acl.get());
+}
+
+// Expects b refused with msg, whose last two arguments are the position.
+error_record expect_invalid(const bytes &b, kx_int32_t status, int msg) {
+    EXPECT_EQ(verify(b), status);
+    error_record e = expect_error(status, msg);
+    EXPECT_EQ(e.str(e.args.size() - 2), "kxacl_acl");
+    return e;
+}
+
+const bytes unix_mech = text_field("unix");
+
+TEST(CheckAclBuffer, Faults) {
+    for (kx_int32_t length : {4, 0, -7}) {
+        sec_buffer_s acl{length, const_cast<unsigned char *>(empty_acl_bytes.data())};
+        EXPECT_EQ(sec__check_acl_buffer(&acl), SEC_S_BAD_ACL);
+        EXPECT_EQ(expect_error(SEC_S_BAD_ACL, MSG_2650_119).num(0), length);
+    }
+    EXPECT_EQ(expect_invalid(make_acl({make_subacl(4, 0, {0}, {})}), 42, MSG_2650_123).num(0), 1);
+    bytes padded = {'u', 'n', 'i', 'x', 0, 0};
+    EXPECT_EQ(expect_invalid(make_acl({make_subacl(8, 0, padded, {})}), 42, MSG_2650_124).str(0),
+              "unix");
+    // Fields without NUL that end the buffer are not read past its end.
+    bytes unterminated = {'u', 'n', 'i', 'x', 'x'};
+    EXPECT_EQ(
+        expect_invalid(make_acl({make_subacl(4, 0, unterminated, {})}), 42, MSG_2650_124).str(0),
+        "unixx");
+    expect_invalid(make_acl({make_subacl(4, 1, unix_mech, {make_record(1, {'b', 'o', 'b'})})}), 43,
+                   MSG_2650_127);
+    EXPECT_EQ(expect_invalid(make_acl({make_subacl(16, 0, {'x', 0}, {})}), 42, MSG_2650_121).num(0),
+              16);
+    expect_invalid(make_acl({make_subacl(2, 2, {}, {make_record(1), make_record(2)})}), 42,
+                   MSG_2650_122);
+    // Version 2 is reported; the bad type after it is never examined.
+    bytes versions =
+        make_acl({make_subacl(2, 1, {}, {make_record(1, {}, 2)}), make_subacl(3, 0, {}, {})});
+    EXPECT_EQ(expect_invalid(versions, 43, MSG_2650_125).num(0), 2);
+    expect_invalid(make_acl({make_subacl(2, 1, {}, {make_record(1, text_field("abc"))})}), 43,
+                   MSG_2650_126);
+    expect_invalid(make_acl({make_subacl(16, 1, {}, {make_record(1)})}), 43, MSG_2650_127);
+    bytes longer = make_subacl(2, 1, {}, {make_record(1)}, 1);
+    expect_invalid(make_acl({longer, make_subacl(1, 0, {}, {})}), 42, MSG_2650_110);
+    expect_invalid(make_acl({longer}), 42, MSG_2650_110); // past the end
+    // Any number of group entries passes.
+    EXPECT_EQ(verify(make_acl(
+                  {make_subacl(16, 3, {},
+                               {make_record(1, text_field("a")), make_record(1, text_field("b")),
+                                make_record(1, text_field("c"))})})),
+              SEC_S_OK);
+}
+
+TEST(FindSubacl, WorkedExampleOffsets) {
+    owned_acl acl(worked_example), header(empty_acl_bytes);
+    auto offset_of = [](owned_acl &in, unsigned char type, const char *mech) -> long {
+        unsigned char *found = nullptr;
+        EXPECT_EQ(sec__find_subacl(in.get(), type, mech, &found), SEC_S_OK);
+        return found ? found - static_cast<unsigned char *>(in.d.value) : -1;
+    };
+    EXPECT_EQ(offset_of(acl, 4, "UNIX"), 45);
+    EXPECT_EQ(offset_of(acl, 16, "ignored"), 22);
+    EXPECT_EQ(offset_of(acl, 2, nullptr), 5);
+    EXPECT_EQ(offset_of(acl, 1, nullptr), -1);
+    EXPECT_EQ(offset_of(acl, 4, "uni"), -1);
+    EXPECT_EQ(offset_of(acl, 8, "unix"), -1);
+    EXPECT_EQ(offset_of(header, 2, nullptr), -1);
+}
+
+// ---- every reader and editor against damaged buffers -----------------------
+
+// A failure comes with its record and is one that bytes can cause.
+void expect_reported(kx_int32_t rc) {
+    if (rc != SEC_S_OK) {
+        EXPECT_TRUE(rc == SEC_S_BAD_ACL || rc == SEC_S_BAD_ACLE || rc == SEC_S_ACLE_NOT_FOUND)
+            << rc;
+        EXPECT_EQ(last_error().id, rc);
+    }
+}
+
+// Validation ignores the last sub-ACL's length and trailing bytes, which no
+// edit can mend; with one more sub-ACL after them they are checked too.
+bool strictly_valid(const bytes &b) {
+    if (b.size() < 5 || b[2] != 2 || b[3] == 0xff || b[4] != 0)
+        return false;
+    bytes longer = b, last = make_subacl(1, 0, {}, {});
+    longer.insert(longer.end(), last.begin(), last.end());
+    longer[3] += 1;
+    return verify(longer) == SEC_S_OK;
+}
+
+void exercise_host_order(const bytes &b) {
+    kx_int32_t rc = verify(b);
+    expect_reported(rc);
+    bool valid = rc == SEC_S_OK && strictly_valid(b);
+    for (unsigned char type : {0, 4, 16}) {
+        owned_acl acl(b);
+        owned_list list;
+        rc = type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
+                  : sec_list_acl(acl.get(), list.get());
+        expect_reported(rc);
+        EXPECT_TRUE(rc == SEC_S_OK || list.l.count == 0);
+        EXPECT_TRUE(!valid || rc == SEC_S_OK);
+    }
+    entry edits[] = {{SEC_ACLE_USER, 7, "unix", "dave"},
+                     {SEC_ACLE_EXPANDED, 7, "krb5", "x*"},
+                     {SEC_ACLE_ANYOTHER, 7},
+                     {SEC_ACLE_USER, 0, "unix", "BOB"},
+                     {SEC_ACLE_GROUP, 0, "", "staff"},
+                     {SEC_ACLE_ANYOTHER, 0}};
+    for (entry &e : edits) {
+        owned_acl acl(b);
+        rc = e.desc.perm == 0 ? sec_del_acle_from_acl(e.p(), acl.get())
+                              : sec_add_acle_to_acl(e.p(), acl.get());
+        expect_reported(rc);
+        if (rc != SEC_S_OK) {
+            EXPECT_EQ(acl.contents(), b) << "a failed edit changed the buffer";
+        } else if (valid) {
+            EXPECT_EQ(sec_convert_acl_to_host(1, acl.get()), SEC_S_OK) << "edit broke the buffer";
+        }
+    }
+}
+
+void exercise_foreign_order(const bytes &b) {
+    owned_acl acl(b);
+    kx_int32_t rc = sec_convert_acl_to_host(1, acl.get());
+    expect_reported(rc);
+    if (rc == SEC_S_OK) {
+        owned_list list;
+        expect_reported(sec_convert_acl_to_host(1, acl.get()));
+        expect_reported(sec_list_acl(acl.get(), list.get()));
+    }
+}
+
+// Every prefix of b, and b with each byte replaced by several values.
+void damage(const bytes &b, void (*exercise)(const bytes &)) {
+    for (std::size_t length = 0; length < b.size() && !::testing::Test::HasFailure(); ++length) {
+        SCOPED_TRACE("prefix of " + std::to_string(length));
+        exercise(bytes(b.begin(), b.begin() + static_cast<long>(length)));
+    }
+    for (std::size_t at = 0; at < b.size() && !::testing::Test::HasFailure(); ++at) {
+        for (int value : {0x00, 0xff, 0x7f, 0x80, b[at] + 1, b[at] - 1}) {
+            SCOPED_TRACE("byte " + std::to_string(at) + " set to " + std::to_string(value));
+            bytes damaged = b;
+            damaged[at] = static_cast<unsigned char>(value);
+            exercise(damaged);
+        }
+    }
+}
+
+TEST(DamagedBuffers, WorkedExample) {
+    damage(worked_example, exercise_host_order);
+    damage(worked_example_swapped, exercise_foreign_order);
+}
+
+TEST(DamagedBuffers, SeveralMechanismsAndLongIdentifiers) {
+    bytes rich = rich_acl();
+    ASSERT_EQ(verify(rich), SEC_S_OK);
+    damage(rich, exercise_host_order);
+    damage(swapped_order(rich), exercise_foreign_order);
+}
+
+} // namespace

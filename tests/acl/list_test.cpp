@@ -1,0 +1,103 @@
+// Listing the entries of ACL buffers.
+#include <gtest/gtest.h>
+
+#include "acl_fixtures.h"
+
+using namespace kxacl;
+using namespace kxtest;
+
+namespace {
+
+const texts unix_users = {"4 unix Alice@node1.cluster.example.com 5",
+                          "4 unix bob@node1.cluster.example.com 3",
+                          "4 unix carol@node1.cluster.example.com 16"};
+const char *const krb5_user = "4 krb5 admin/node1.cluster.example.com@REALM 1";
+
+// type 0 lists everything.
+texts listed(const bytes &b, unsigned char type = 0, const char *mech = nullptr) {
+    owned_acl acl(b);
+    owned_list list;
+    EXPECT_EQ(type ? sec_list_acl_by_type(acl.get(), type, const_cast<char *>(mech), list.get())
+                   : sec_list_acl(acl.get(), list.get()),
+              SEC_S_OK);
+    return list.described();
+}
+
+TEST(ListAcl, OrderAndSpellingAsStored) {
+    texts all = {
+        "2  - 8191",          "1  - 1",     krb5_user, "8 unix z*@node2 7", "8 unix a*@node3 2",
+        "16  b\xc3\xb6rse 4", "16  staff 1"};
+    all.insert(all.end(), unix_users.begin(), unix_users.end());
+    EXPECT_EQ(listed(rich_acl()), all);
+    // Neither the mechanism's case nor non-UTF-8 bytes are touched.
+    bytes b = make_acl({make_subacl(
+        4, 2, text_field("UniX"),
+        {make_record(1, text_field("\xe9t\xe9")), make_record(2, text_field("Zo\xc3\xab"))})});
+    EXPECT_EQ(listed(b), (texts{"4 UniX Zo\xc3\xab 2", "4 UniX \xe9t\xe9 1"}));
+}
+
+TEST(ListAclByType, MechanismsAndTypes) {
+    bytes rich = rich_acl();
+    EXPECT_EQ(listed(rich, SEC_ACLE_USER, "UNIX"), unix_users);
+    texts users = unix_users;
+    users.insert(users.begin(), krb5_user);
+    EXPECT_EQ(listed(rich, SEC_ACLE_USER, nullptr), users);
+    EXPECT_EQ(listed(rich, SEC_ACLE_UNAUTHENTICATED, "a-mechanism-of-20-ch"), texts{"1  - 1"});
+    EXPECT_EQ(listed(rich, SEC_ACLE_EXPANDED, "krb5"), texts{});
+    EXPECT_EQ(listed(worked_example, SEC_ACLE_UNAUTHENTICATED), texts{});
+}
+
+TEST(ListAcl, EmptyAclsListNothingAndRefusalsLeaveTheList) {
+    for (const bytes &b : {bytes{}, empty_acl_bytes}) {
+        EXPECT_EQ(listed(b), texts{});
+        EXPECT_EQ(listed(b, SEC_ACLE_GROUP), texts{});
+    }
+    owned_acl foreign(worked_example_swapped);
+    sec_acle_list_s list{5, reinterpret_cast<sec_acle_t *>(8)};
+    EXPECT_EQ(sec_list_acl(foreign.get(), &list), SEC_S_BAD_ACL);
+    expect_error(SEC_S_BAD_ACL, MSG_2650_115);
+    EXPECT_EQ(sec_list_acl_by_type(foreign.get(), SEC_ACLE_USER, nullptr, &list), SEC_S_BAD_ACL);
+    expect_error(SEC_S_BAD_ACL, MSG_2650_115);
+    sec_buffer_s no_value{71, nullptr};
+    EXPECT_EQ(sec_list_acl(&no_value, &list), SEC_S_BAD_ACL);
+    expect_error(SEC_S_BAD_ACL, MSG_2650_109);
+    EXPECT_EQ(list.count, 5);
+    EXPECT_EQ(list.acles, reinterpret_cast<sec_acle_t *>(8));
+}
+
+TEST(ListAcl, ReleaseEmptiesTheListOnce) {
+    owned_acl acl(worked_example);
+    sec_acle_list_s list{0, nullptr};
+    ASSERT_EQ(sec_list_acl(acl.get(), &list), SEC_S_OK);
+    ASSERT_EQ(list.count, 3);
+    sec_release_aclelist(&list);
+    EXPECT_EQ(list.count, 0);
+    EXPECT_EQ(list.acles, nullptr);
+    sec_release_aclelist(&list);
+    sec_release_aclelist(nullptr);
+}
+
+// Every allocation of a listing fails in turn: the list ends empty.
+TEST(AllocationFailure, ListAclAndListAclByType) {
+    bytes rich = rich_acl();
+    for (unsigned char type : {0, SEC_ACLE_USER, SEC_ACLE_GROUP}) {
+        EXPECT_GE(for_each_allocation_failure([&](long n) {
+                      owned_acl acl(rich);
+                      owned_list list;
+                      kx_int32_t rc = failing_after(n, [&] {
+                          return type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
+                                      : sec_list_acl(acl.get(), list.get());
+                      });
+                      if (rc != SEC_S_OK) {
+                          expect_no_memory(rc, {"sec__create_acle", "sec__add_acle_to_tree",
+                                                "sec__acltree_to_aclelist"});
+                          EXPECT_EQ(list.l.count, 0);
+                          EXPECT_EQ(list.l.acles, nullptr);
+                      }
+                      return rc;
+                  }),
+                  4);
+    }
+}
+
+} // namespace

@@ -1,0 +1,127 @@
+// Entry trees: order, duplicates, the array of trees.
+#include <cstdio>
+
+#include <gtest/gtest.h>
+
+#include <kx_cu.h>
+
+#include "acl_fixtures.h"
+
+using namespace kxacl;
+using namespace kxtest;
+
+namespace {
+
+struct owned_tree {
+    sec_acltree_t t = nullptr;
+    owned_tree() = default;
+    owned_tree(const owned_tree &) = delete;
+    ~owned_tree() { sec__free_acltree(t); }
+    kx_int32_t add(sec_boolean_t single, entry e) {
+        return sec__add_acle_to_tree(single, e.p(), &t);
+    }
+    // "id/perm" of each entry, in the order the tree writes them.
+    texts walked() const {
+        texts out;
+        walk_acltree(t, [&](sec_acltree_node_s *n) {
+            const sec_acle_desc &a = *n->sat_acle;
+            out.push_back(std::string(a.id ? a.id : "-") + "/" + std::to_string(a.perm));
+            return SEC_S_OK;
+        });
+        return out;
+    }
+};
+
+TEST(Acltree, UserAndGroupByIdentityExpandedAsAdded) {
+    owned_tree user, group, expanded;
+    for (const char *id : {"c", "a", "B"})
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
+    for (const char *id : {"wheel", "Staff", "_x", "Zeta"})
+        ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 2, "", id}), SEC_S_OK);
+    for (const char *id : {"z", "a", "m"})
+        ASSERT_EQ(expanded.add(1, {SEC_ACLE_EXPANDED, 3, "unix", id}), SEC_S_OK);
+    EXPECT_EQ(user.walked(), (texts{"a/1", "B/1", "c/1"}));
+    EXPECT_EQ(group.walked(), (texts{"_x/2", "Staff/2", "wheel/2", "Zeta/2"}));
+    EXPECT_EQ(expanded.walked(), (texts{"z/3", "a/3", "m/3"}));
+}
+
+TEST(Acltree, DuplicatesRefusedOrMerged) {
+    owned_tree user, group, anyother;
+    ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "Alice"}), SEC_S_OK);
+    EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 2, "UNIX", "alice"}), SEC_S_BAD_ACLE);
+    error_record e = expect_error(SEC_S_BAD_ACLE, MSG_2650_157);
+    EXPECT_EQ(e.num(0), 'u');
+    EXPECT_EQ(e.str(1) + " " + e.str(2), "UNIX alice");
+    EXPECT_EQ(user.walked(), texts{"Alice/1"});
+    EXPECT_EQ(user.add(0, {SEC_ACLE_USER, 2, "unix", "alice"}), SEC_S_OK);
+    EXPECT_EQ(user.walked(), texts{"Alice/2"});
+
+    ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "staff"}), SEC_S_OK);
+    EXPECT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "Staff"}), SEC_S_BAD_ACLE);
+    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_175).str(1), "Staff");
+
+    ASSERT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 1}), SEC_S_OK);
+    EXPECT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 4}), SEC_S_BAD_ACLE);
+    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_174).num(0), 'o');
+    EXPECT_EQ(anyother.add(0, {SEC_ACLE_ANYOTHER, 4}), SEC_S_OK);
+    EXPECT_EQ(anyother.walked(), texts{"-/4"});
+}
+
+TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
+    owned_trees trees;
+    ASSERT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
+    ASSERT_EQ(trees.add({SEC_ACLE_GROUP, 1, "", "staff"}), SEC_S_OK);
+    ASSERT_EQ(trees.add({SEC_ACLE_USER, 1, "UNIX", "alice"}), SEC_S_OK);
+    ASSERT_EQ(trees.add({SEC_ACLE_ANYOTHER, 1}), SEC_S_OK);
+    ASSERT_EQ(trees.count, 3);
+    owned_acl acl;
+    ASSERT_EQ(sec__acltrees_to_acl(trees.trees, trees.count, acl.get()), SEC_S_OK);
+    EXPECT_EQ(acl.contents(),
+              make_acl({make_subacl(2, 1, {}, {make_record(1)}),
+                        make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}),
+                        make_subacl(4, 2, text_field("unix"),
+                                    {make_record(1, text_field("alice")),
+                                     make_record(3, text_field("bob"))})}));
+}
+
+TEST(Acltree, SortedInsertionOfManyIdentities) {
+    constexpr int count = 200000;
+    owned_tree user;
+    char id[16];
+    for (int i = 0; i < count; ++i) {
+        std::snprintf(id, sizeof id, "u%07d", i);
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
+    }
+    int seen = 0;
+    const char *previous = "";
+    walk_acltree(user.t, [&](sec_acltree_node_s *n) {
+        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
+        previous = n->sat_acle->id;
+        return ++seen, SEC_S_OK;
+    });
+    EXPECT_EQ(seen, count);
+    EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "U0199999"}), SEC_S_BAD_ACLE);
+}
+
+TEST(AllocationFailure, AddAcleToTrees) {
+    // Into an existing tree, and as a new key that grows the array.
+    for (entry added :
+         {entry{SEC_ACLE_USER, 1, "unix", "carol"}, entry{SEC_ACLE_GROUP, 1, "", "x"}}) {
+        EXPECT_GE(for_each_allocation_failure([&](long n) {
+                      owned_trees trees;
+                      EXPECT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
+                      kx_int32_t rc = failing_after(n, [&] { return trees.add(added); });
+                      if (rc != SEC_S_OK) {
+                          expect_no_memory(rc, {"sec__add_acle_to_trees", "sec__add_acle_to_tree"});
+                          std::size_t entries = 0;
+                          for (int i = 0; i < trees.count; ++i)
+                              entries += tree_entry_count(trees.trees[i]);
+                          EXPECT_EQ(entries, 1u);
+                      }
+                      return rc;
+                  }),
+                  3);
+    }
+}
+
+} // namespace
