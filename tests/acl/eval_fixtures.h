@@ -36,8 +36,8 @@ inline bytes example_acl() {
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
 }
 
-// The first length bytes of b, in a block of exactly that size (none: the
-// empty ACL).
+// The first length bytes of b: a buffer cut short. owned_acl holds it in a
+// block of exactly that size (none at all for length 0, the empty ACL).
 inline bytes prefix(const bytes &b, std::size_t length) {
     return bytes(b.begin(), b.begin() + static_cast<std::ptrdiff_t>(length));
 }
