@@ -1,0 +1,196 @@
+// Locating an ACL file, looking up the user who owns it, and reading a
+// whole open file into memory.
+#include "files.h"
+
+#include <cerrno>
+#include <climits>
+#include <cstdint>
+#include <cstring>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "alloc.h"
+#include "frame.h"
+#include "report.h"
+
+namespace kxacl {
+
+namespace {
+
+// Work buffer of the user lookup when the system recommends no size:
+// sysconf answers -1 where the size is unbounded, and a doubled -1 would
+// make the lookup fail for every user. 16 KiB, doubled, holds any sane
+// password entry. A recommendation above 1 MiB is capped at that, so that
+// the doubled size stays a signed 32-bit byte count.
+constexpr kx_int32_t fallback_pw_buffer_size = 16384;
+constexpr kx_int32_t largest_pw_buffer_size = 1 << 20;
+
+kx_int32_t pw_buffer_size() {
+    long recommended = sysconf(_SC_GETPW_R_SIZE_MAX);
+    if (recommended <= 0)
+        return fallback_pw_buffer_size;
+    if (recommended > largest_pw_buffer_size)
+        return largest_pw_buffer_size;
+    return static_cast<kx_int32_t>(recommended);
+}
+
+kx_int32_t user_not_found(const char *uname) {
+    return report<MSG_2650_140>(SEC_S_USER_NOT_FOUND, uname);
+}
+
+// Writes "/" unless the directory already in path (dir_length characters)
+// ends with one, then name. The caller has made sure that the result fits.
+void append_name(char *path, std::size_t dir_length, const char *name, std::size_t name_length) {
+    if (dir_length == 0 || path[dir_length - 1] != '/')
+        path[dir_length++] = '/';
+    std::memcpy(path + dir_length, name, name_length + 1);
+}
+
+kx_int32_t path_in_home(const char *filename, const char *username, char *aclfname, uid_t *uid) {
+    // A path in the name would lead out of the user's home directory.
+    if (std::strchr(filename, '/'))
+        return report<MSG_2650_165>(SEC_S_BAD_PARAM, filename, username);
+    std::size_t home_length = 0;
+    kx_int32_t rc = sec__get_user_info(username, uid, aclfname, &home_length);
+    if (rc != SEC_S_OK)
+        return rc;
+    // A home directory longer than a path buffer fails here too, since it
+    // alone already exceeds the limit.
+    std::size_t name_length = std::strlen(filename);
+    if (home_length + name_length + 1 > max_path_length)
+        return report<MSG_2650_165>(SEC_S_BAD_PARAM, filename, username);
+    append_name(aclfname, home_length, filename, name_length);
+    return SEC_S_OK;
+}
+
+kx_int32_t path_from_working_dir(const char *filename, char *aclfname) {
+    std::size_t name_length = std::strlen(filename);
+    if (filename[0] == '/') {
+        // A full path longer than a path buffer names no file that the
+        // system could open: the same report as a file that is not there.
+        if (name_length > max_path_length)
+            return report<MSG_2650_135>(SEC_S_NO_ACL_FILE, filename, ENAMETOOLONG);
+        std::memcpy(aclfname, filename, name_length + 1);
+        return SEC_S_OK;
+    }
+    if (!getcwd(aclfname, max_path_length + 1))
+        return report<MSG_2650_166>(SEC_S_NO_ACL_FILE, "getcwd()", errno);
+    std::size_t dir_length = std::strlen(aclfname);
+    if (dir_length + name_length + 1 > max_path_length)
+        return report<MSG_2650_167>(SEC_S_NO_ACL_FILE, aclfname, filename);
+    append_name(aclfname, dir_length, filename, name_length);
+    return SEC_S_OK;
+}
+
+// 2650-135 for a file whose status cannot be taken, with its Info point.
+kx_int32_t examine_failed(const char *aclfname, int err) {
+    if (trace_level(TRC_INFO) != 0)
+        trace_data(123, text(aclfname), num(err));
+    return report<MSG_2650_135>(SEC_S_FILE_ERROR, aclfname, err);
+}
+
+// 2650-139: got bytes (-1 for a read error) of a file of size bytes.
+kx_int32_t short_read(const char *aclfname, std::uint64_t size, std::int64_t got, int err) {
+    if (trace_level(TRC_INFO) != 0)
+        trace_data(127, text(aclfname), num(size), num(got));
+    int shown = got < 0 ? -1 : byte_count(static_cast<std::size_t>(got));
+    return report<MSG_2650_139>(SEC_S_FILE_ERROR, shown, byte_count(size), err);
+}
+
+kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
+                            std::size_t *aclfsize, bool *replaced) {
+    struct stat by_name, opened;
+    if (stat(aclfname, &by_name) != 0)
+        return examine_failed(aclfname, errno);
+    if (fstat(aclfdes, &opened) != 0)
+        return examine_failed(aclfname, errno);
+    auto size = static_cast<std::uint64_t>(by_name.st_size);
+    // The size comes from the name, the bytes from the descriptor: when the
+    // name has meanwhile been given to another file (a replacing rename),
+    // the two belong to different files, and the read counts as short
+    // rather than mixing an old file with a new size.
+    if (by_name.st_dev != opened.st_dev || by_name.st_ino != opened.st_ino) {
+        *replaced = true;
+        return short_read(aclfname, size, 0, 0);
+    }
+    if (size == 0)
+        return SEC_S_OK;
+    unique_mem<char> buffer(static_cast<char *>(mem_zalloc(size + 1)));
+    if (!buffer) {
+        if (trace_level(TRC_INFO) != 0)
+            trace_data(125, text(aclfname), num(size));
+        return no_memory("sec_read_acl_file", size + 1);
+    }
+    // One read of the whole size; a short count is not retried.
+    errno = 0;
+    ssize_t got = read(aclfdes, buffer.get(), size);
+    if (got < 0 || static_cast<std::uint64_t>(got) != size)
+        return short_read(aclfname, size, got, got < 0 ? errno : 0);
+    *aclfbuf = buffer.release();
+    *aclfsize = size;
+    return SEC_S_OK;
+}
+
+} // namespace
+
+kx_int32_t sec__get_aclfname(const char *filename, const char *username, char *aclfname,
+                             uid_t *uid) {
+    return username ? path_in_home(filename, username, aclfname, uid)
+                    : path_from_working_dir(filename, aclfname);
+}
+
+kx_int32_t sec__get_user_info(const char *uname, uid_t *uid, char *hdir, std::size_t *hdir_length) {
+    kx_int32_t size = pw_buffer_size();
+    std::size_t bytes = 2 * static_cast<std::size_t>(size);
+    unique_mem<char> work(static_cast<char *>(mem_alloc(bytes)));
+    if (!work)
+        return no_memory("sec__get_user_info", bytes);
+    // An empty name names nobody; the system is not asked, since what it
+    // answers for "" differs between name services.
+    if (uname[0] == '\0')
+        return user_not_found(uname);
+    passwd entry{};
+    passwd *found = nullptr;
+    if (getpwnam_r(uname, &entry, work.get(), bytes, &found) != 0 || !found)
+        return user_not_found(uname);
+    // Name services may match loosely (case, aliases); the user must be
+    // found under exactly the name given.
+    if (std::strncmp(found->pw_name, uname, static_cast<std::size_t>(size)) != 0)
+        return user_not_found(uname);
+    const char *home = found->pw_dir ? found->pw_dir : "";
+    std::size_t length = std::strlen(home);
+    *uid = found->pw_uid;
+    *hdir_length = length;
+    if (length > max_path_length)
+        hdir[0] = '\0';
+    else
+        std::memcpy(hdir, home, length + 1);
+    return SEC_S_OK;
+}
+
+kx_int32_t acl__lock_acl_file(const char *, int, kx_uint32_t) {
+    return SEC_S_OK;
+}
+
+kx_int32_t read_whole_file(const char *aclfname, int aclfdes, char **aclfbuf, std::size_t *aclfsize,
+                           bool *replaced) {
+    perf_timer timer(perf_at(2));
+    *aclfbuf = nullptr;
+    *aclfsize = 0;
+    *replaced = false;
+    kx_int32_t rc = read_into_buffer(aclfname, aclfdes, aclfbuf, aclfsize, replaced);
+    if (timer.wanted()) {
+        perf_elapsed e = timer.elapsed();
+        trace_data(6, num(e.ticks), num(e.seconds), num(e.nanoseconds));
+    }
+    return rc;
+}
+
+kx_int32_t acl__read_acl_file(const char *aclfname, int aclfdes, char **aclfbuf,
+                              std::size_t *aclfsize) {
+    bool replaced = false;
+    return read_whole_file(aclfname, aclfdes, aclfbuf, aclfsize, &replaced);
+}
+
+} // namespace kxacl

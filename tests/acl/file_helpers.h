@@ -1,0 +1,173 @@
+// Helpers of the ACL file tests: files with given bytes, modes and times,
+// directory listings, paths of exact lengths, and throw-away users.
+#ifndef KXACL_TEST_FILE_HELPERS_H
+#define KXACL_TEST_FILE_HELPERS_H
+
+#include <algorithm>
+#include <cstdlib>
+#include <dirent.h>
+#include <fcntl.h>
+#include <grp.h>
+#include <string>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+namespace kxtest {
+
+inline void write_file(const std::string &path, const std::string &bytes, mode_t mode = 0644) {
+    int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+    ASSERT_GE(fd, 0) << path;
+    ASSERT_EQ(write(fd, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
+    ASSERT_EQ(fchmod(fd, mode), 0);
+    close(fd);
+}
+
+inline std::string read_file(const std::string &path) {
+    std::string bytes;
+    int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0)
+        return "<missing>";
+    char chunk[4096];
+    for (ssize_t n; (n = read(fd, chunk, sizeof chunk)) > 0;)
+        bytes.append(chunk, static_cast<std::size_t>(n));
+    close(fd);
+    return bytes;
+}
+
+inline bool exists(const std::string &path) {
+    struct stat st;
+    return lstat(path.c_str(), &st) == 0;
+}
+
+inline struct stat status_of(const std::string &path) {
+    struct stat st {};
+    EXPECT_EQ(lstat(path.c_str(), &st), 0) << path;
+    return st;
+}
+
+// Moves the file's modification time by delta seconds.
+inline void shift_mtime(const std::string &path, long delta) {
+    struct stat st = status_of(path);
+    timespec times[2] = {st.st_atim, st.st_mtim};
+    times[1].tv_sec += delta;
+    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;
+}
+
+// Sets the modification time to exactly seconds (and 0 nanoseconds).
+inline void set_mtime(const std::string &path, time_t seconds) {
+    timespec times[2] = {{0, UTIME_OMIT}, {seconds, 0}};
+    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;
+}
+
+// The names in a directory, sorted, without "." and "..".
+inline std::vector<std::string> dir_entries(const std::string &dir) {
+    std::vector<std::string> names;
+    if (DIR *d = opendir(dir.c_str())) {
+        while (dirent *e = readdir(d)) {
+            std::string n = e->d_name;
+            if (n != "." && n != "..")
+                names.push_back(n);
+        }
+        closedir(d);
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+// Removes a directory and the files (not subdirectories) in it.
+struct removed_at_end {
+    std::string dir;
+    ~removed_at_end() {
+        for (const auto &name : dir_entries(dir))
+            unlink((dir + "/" + name).c_str());
+        rmdir(dir.c_str());
+    }
+};
+
+// A path of exactly length characters under base, whose directories are
+// made; the last component (the file) is not.
+inline std::string path_of_length(const std::string &base, std::size_t length) {
+    std::string p = base;
+    while (length - p.size() > 256) {
+        p += "/" + std::string(200, 'd');
+        EXPECT_EQ(mkdir(p.c_str(), 0755), 0) << p.size();
+    }
+    return p + "/" + std::string(length - p.size() - 1, 'f');
+}
+
+// The ACL compiled from "u unix bob rw", "g staff r", "o r" (in that order):
+// the sub-ACLs stand in the reverse order of their first lines.
+inline std::string example_acl() {
+    static const unsigned char bytes[] = {
+        0x85, 0x01, 0x02, 0x03, 0x00,                               // header, 3 sub-ACLs
+        0x11, 0x00, 0x00, 0x00, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00, // anyother
+        0x01, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00,                   //   o r
+        0x17, 0x00, 0x00, 0x00, 0x10, 0x01, 0x00, 0x00, 0x00, 0x00, // group
+        0x01, 0x01, 0x00, 0x00, 0x00, 0x06, 0x00, 's',  't',  'a',  'f',  'f',
+        0x00, 0x1a, 0x00, 0x00, 0x00, 0x04, 0x01, 0x00, 0x00, 0x00, 0x05, // user "unix"
+        'u',  'n',  'i',  'x',  0x00,                                     //
+        0x01, 0x03, 0x00, 0x00, 0x00, 0x04, 0x00, 'b',  'o',  'b',  0x00};
+    return std::string(reinterpret_cast<const char *>(bytes), sizeof bytes);
+}
+inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
+
+// A user made for one test with useradd, removed again with userdel.
+class scoped_user {
+  public:
+    explicit scoped_user(const std::string &home) {
+        static int made = 0;
+        name_ = "kxt" + std::to_string(getpid()) + "x" + std::to_string(made++);
+        ok_ = run("useradd -M -N -s /usr/sbin/nologin -d '" + home + "' " + name_);
+    }
+    ~scoped_user() {
+        if (ok_)
+            run("userdel " + name_);
+    }
+    scoped_user(const scoped_user &) = delete;
+    scoped_user &operator=(const scoped_user &) = delete;
+    bool ok() const { return ok_; }
+    const std::string &name() const { return name_; }
+
+  private:
+    // The password files are locked while another useradd runs: try again.
+    static bool run(const std::string &command) {
+        for (int attempt = 0; attempt < 50; ++attempt) {
+            if (std::system((command + " >/dev/null 2>&1").c_str()) == 0)
+                return true;
+            usleep(100000);
+        }
+        return false;
+    }
+    std::string name_;
+    bool ok_ = false;
+};
+
+// Runs check() in a child process that has given up root for uid and gid,
+// and gives back check()'s result (the exit code), 200 when the child did not
+// exit normally, 100 when it could not change its user.
+template <typename Check> int exit_code_as_user(uid_t uid, gid_t gid, Check check) {
+    pid_t pid = fork();
+    if (pid == 0) {
+        if (setgroups(0, nullptr) != 0 || setgid(gid) != 0 || setuid(uid) != 0)
+            _exit(100);
+        _exit(check());
+    }
+    int status = 0;
+    if (pid < 0 || waitpid(pid, &status, 0) != pid || !WIFEXITED(status))
+        return 200;
+    return WEXITSTATUS(status);
+}
+
+#define KXTEST_REQUIRE_ROOT()                                                                      \
+    do {                                                                                           \
+        if (geteuid() != 0)                                                                        \
+            GTEST_SKIP() << "SKIPPED: needs root (creates users or changes file owners)";          \
+    } while (0)
+
+} // namespace kxtest
+
+#endif
