@@ -26,7 +26,9 @@ header_state inspect_header(const sec_buffer_s &acl) {
     return header_state::ok;
 }
 
-std::uint16_t subacl_count(acl_bytes b) { return load_u16(b.data + layout::at_subacl_count); }
+std::uint16_t subacl_count(acl_bytes b) {
+    return load_u16(b.data + layout::at_subacl_count);
+}
 
 bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v) {
     if (offset > b.size || b.size - offset < layout::subacl_header_size)

@@ -1,0 +1,212 @@
+// Conversion between sub-ACLs, entry trees and entry lists.
+#include "convert.h"
+
+#include <cstring>
+
+#include "alloc.h"
+#include "byteorder.h"
+#include "entries.h"
+#include "report.h"
+
+namespace kxacl {
+
+namespace {
+
+// The mechanism of a user or expanded sub-ACL as a text that fits an
+// entry's field; a longer or unterminated one is refused before any copy.
+kx_int32_t subacl_mech(const subacl_view &v, const char **mech) {
+    *mech = "";
+    if (!type_has_mech(v.type))
+        return SEC_S_OK;
+    if (v.mech_length < 2 || v.mech_length > layout::max_mech_length) {
+        source_pos pos = here(src_acl);
+        return report<MSG_2650_123>(SEC_S_BAD_ACL, v.mech_length, pos.file, pos.line);
+    }
+    if (v.mech[v.mech_length - 1] != '\0')
+        return report_corrupt(here(src_acl));
+    *mech = v.mech;
+    return SEC_S_OK;
+}
+
+// Adds the entry of one record to the tree.
+kx_int32_t add_record(const subacl_view &v, const char *mech, const acle_view &e,
+                      sec_acltree_t *tree) {
+    const char *id = nullptr;
+    if (type_has_id(v.type)) {
+        // The identifier must end within its record to be read as a text.
+        if (!e.id_terminated())
+            return report_corrupt(here(src_acl));
+        id = e.id;
+    }
+    sec_acle_t entry = nullptr;
+    kx_int32_t rc = sec__create_acle(v.type, e.perm, mech, id, 0, &entry);
+    if (rc != SEC_S_OK)
+        return rc;
+    unique_acle owned(entry);
+    return sec__add_acle_to_tree(0, entry, tree);
+}
+
+std::size_t subacl_header_length(sec_acltree_t tree) {
+    return type_has_mech(tree->sat_type)
+               ? layout::subacl_header_size + std::strlen(tree->sat_mech) + 1
+               : layout::subacl_header_size;
+}
+
+std::size_t record_length(const sec_acle_t acle) {
+    return layout::acle_header_size + (type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0);
+}
+
+// The size of the tree's sub-ACL, 0 when it holds no entry. An identifier
+// that its length field cannot hold, or a sub-ACL beyond a buffer's reach,
+// is refused rather than written cut short.
+kx_int32_t subacl_length(sec_acltree_t tree, std::size_t *length) {
+    *length = 0;
+    std::size_t total = 0;
+    kx_int32_t rc = walk_acltree(tree, [&](sec_acltree_node_s *n) {
+        std::size_t record = record_length(n->sat_acle);
+        if (record - layout::acle_header_size > layout::max_id_length)
+            return report<MSG_2650_117>(SEC_S_BAD_ACLE, n->sat_acle->type);
+        total += record;
+        if (total > layout::max_buffer_length)
+            return no_memory("sec__acltree_to_subacl", total);
+        return SEC_S_OK;
+    });
+    if (rc == SEC_S_OK && total > 0)
+        *length = total + subacl_header_length(tree);
+    return rc;
+}
+
+// Writes the tree's sub-ACL of the given length at out.
+void write_subacl(sec_acltree_t tree, std::size_t length, unsigned char *out) {
+    std::memset(out, 0, length);
+    store_u32(out + layout::at_subacl_length, static_cast<std::uint32_t>(length));
+    out[layout::at_subacl_type] = tree->sat_type;
+    std::size_t offset = subacl_header_length(tree);
+    if (type_has_mech(tree->sat_type)) {
+        out[layout::at_mech_length] = static_cast<unsigned char>(offset - layout::at_mech);
+        std::memcpy(out + layout::at_mech, tree->sat_mech, offset - layout::at_mech);
+    }
+    std::uint32_t count = 0;
+    walk_acltree(tree, [&](sec_acltree_node_s *n) {
+        const sec_acle_t acle = n->sat_acle;
+        unsigned char *record = out + offset;
+        record[layout::at_acle_version] = layout::acle_version;
+        store_u32(record + layout::at_perm, acle->perm);
+        if (type_has_id(acle->type)) {
+            std::size_t id_length = std::strlen(acle->id) + 1;
+            store_u16(record + layout::at_id_length, static_cast<std::uint16_t>(id_length));
+            std::memcpy(record + layout::at_id, acle->id, id_length);
+        }
+        offset += record_length(acle);
+        ++count;
+        return SEC_S_OK;
+    });
+    store_u32(out + layout::at_acle_count, count);
+}
+
+} // namespace
+
+kx_int32_t sec__subacl_to_acltree(acl_bytes b, const subacl_view &v, sec_acltree_t *tree) {
+    *tree = nullptr;
+    if (!type_has_id(v.type) && v.count > 1)
+        return report<MSG_2650_111>(SEC_S_BAD_ACL);
+    const char *mech = nullptr;
+    kx_int32_t rc = subacl_mech(v, &mech);
+    std::size_t offset = v.first_entry;
+    for (std::uint32_t i = 0; rc == SEC_S_OK && i < v.count; ++i) {
+        acle_view e;
+        if (!read_acle(b, offset, &e)) {
+            rc = report_corrupt(here(src_acl));
+        } else {
+            rc = add_record(v, mech, e, tree);
+            offset = e.next;
+        }
+    }
+    if (rc != SEC_S_OK) {
+        sec__free_acltree(*tree);
+        *tree = nullptr;
+    }
+    return rc;
+}
+
+kx_int32_t sec__acltree_to_subacl(const sec_acltree_t tree, unsigned char **subacl,
+                                  std::size_t *length) {
+    *subacl = nullptr;
+    kx_int32_t rc = subacl_length(tree, length);
+    if (rc != SEC_S_OK || *length == 0)
+        return rc;
+    auto *out = static_cast<unsigned char *>(mem_alloc(*length));
+    if (!out)
+        return no_memory("sec__acltree_to_subacl", *length);
+    write_subacl(tree, *length, out);
+    *subacl = out;
+    return SEC_S_OK;
+}
+
+kx_int32_t sec__acltrees_to_acl(sec_acltree_t *acltrees, kx_int32_t count, sec_acl_buffer_t acl) {
+    acl->length = 0;
+    acl->value = nullptr;
+    // Sizes first, so that the buffer is allocated once.
+    std::size_t total = layout::header_size, subacls = 0;
+    for (kx_int32_t i = count - 1; i >= 0; --i) {
+        std::size_t length = 0;
+        kx_int32_t rc = subacl_length(acltrees[i], &length);
+        if (rc != SEC_S_OK)
+            return rc;
+        total += length;
+        subacls += length > 0;
+        if (total > layout::max_buffer_length || subacls > layout::max_subacls)
+            return no_memory("sec__acltrees_to_acl", total);
+    }
+    sec_buffer_s header{};
+    if (!new_empty_buffer(&header))
+        return no_memory("sec__acltrees_to_acl", layout::header_size);
+    auto *out = static_cast<unsigned char *>(mem_realloc(header.value, total));
+    if (!out) {
+        std::free(header.value);
+        return no_memory("sec__acltrees_to_acl", total);
+    }
+    store_u16(out + layout::at_subacl_count, static_cast<std::uint16_t>(subacls));
+    std::size_t offset = layout::header_size;
+    for (kx_int32_t i = count - 1; i >= 0; --i) {
+        std::size_t length = 0;
+        subacl_length(acltrees[i], &length);
+        if (length > 0)
+            write_subacl(acltrees[i], length, out + offset);
+        offset += length;
+    }
+    acl->value = out;
+    acl->length = static_cast<kx_int32_t>(total);
+    return SEC_S_OK;
+}
+
+kx_int32_t sec__acltree_to_aclelist(sec_acltree_t tree, sec_acle_list_t aclelist) {
+    std::size_t moving = tree_entry_count(tree);
+    if (moving == 0)
+        return SEC_S_OK;
+    std::size_t count = static_cast<std::size_t>(aclelist->count);
+    if (count + moving > 0x7fffffff)
+        return no_memory("sec__acltree_to_aclelist", (count + moving) * sizeof(sec_acle_t));
+    // Room for the whole tree at once: the list grows once per tree.
+    std::size_t bytes = (count + moving) * sizeof(sec_acle_t);
+    auto *grown = static_cast<sec_acle_t *>(mem_realloc(aclelist->acles, bytes));
+    if (!grown)
+        return no_memory("sec__acltree_to_aclelist", bytes);
+    aclelist->acles = grown;
+    return walk_acltree(tree, [&](sec_acltree_node_s *n) {
+        grown[aclelist->count++] = n->sat_acle;
+        n->sat_acle = nullptr;
+        return SEC_S_OK;
+    });
+}
+
+kx_int32_t append_subacl_to_list(acl_bytes b, const subacl_view &v, sec_acle_list_t list) {
+    sec_acltree_t tree = nullptr;
+    kx_int32_t rc = sec__subacl_to_acltree(b, v, &tree);
+    if (rc == SEC_S_OK)
+        rc = sec__acltree_to_aclelist(tree, list);
+    sec__free_acltree(tree);
+    return rc;
+}
+
+} // namespace kxacl

@@ -1,0 +1,94 @@
+// Entry trees: the entries of one sub-ACL while an ACL is built or changed,
+// kept in the order that the buffer format requires and free of duplicates.
+//
+// A tree keeps its nodes twice: in a height-balanced search tree ordered by
+// identity (case-insensitive in the POSIX locale), where duplicates are
+// found in O(log n) whatever the order of insertion, and in a list in
+// insertion order. User and group entries are written in identity order,
+// expanded entries in insertion order. Balance keeps every walk's depth near
+// log2 n, so recursion over the search tree is bounded.
+#ifndef KXACL_TREE_H
+#define KXACL_TREE_H
+
+#include <cstddef>
+
+#include <kx_acl.h>
+
+namespace kxacl {
+
+// One node; a node whose entry was deleted keeps its place with a null entry.
+struct sec_acltree_node_s {
+    sec_acle_t sat_acle;
+    sec_acltree_node_s *sat_left;
+    sec_acltree_node_s *sat_right;
+    sec_acltree_node_s *sat_next; // insertion order
+    int sat_height;
+};
+
+// A tree of one sub-ACL key. The key is that of its first entry, whose
+// mechanism spelling the sub-ACL keeps. A null sec_acltree_t is the empty tree.
+typedef struct sec_acltree_s {
+    sec_acltree_node_s *sat_root;
+    sec_acltree_node_s *sat_first; // first inserted
+    sec_acltree_node_s *sat_last;  // last inserted
+    unsigned char sat_type;
+    char sat_mech[SEC_MECH_MAX + 1];
+} sec_acltree_desc, *sec_acltree_t;
+
+// Inserts a copy of acle into the tree at *tree (made when empty). With
+// single, an entry of the same identity is a failure (2650-157/174/175);
+// without, that entry takes acle's mask. The tree is unchanged on failure.
+kx_int32_t sec__add_acle_to_tree(sec_boolean_t single, const sec_acle_t acle, sec_acltree_t *tree);
+
+// Puts acle into the tree of its sub-ACL key in the array, adding a tree at
+// the end for a new key. Always refuses duplicates.
+kx_int32_t sec__add_acle_to_trees(const sec_acle_t acle, sec_acltree_t **trees, int *nooftrees);
+
+// Releases the entry of acle's identity, leaving its node with a null entry.
+kx_int32_t sec__del_acle_from_tree(const sec_acle_t acle, sec_acltree_t tree);
+
+// Releases the tree, its nodes and the entries still in it. Null is accepted.
+void sec__free_acltree(sec_acltree_t tree);
+
+// Frees an array of trees, from the last to the first, and the array.
+void free_acltrees(sec_acltree_t *trees, int count);
+
+// Number of nodes that still hold an entry.
+std::size_t tree_entry_count(sec_acltree_t tree);
+
+// Calls visit(node) for each node holding an entry, in the order of the
+// sub-ACL: identity order for user and group trees, insertion order for the
+// others. Stops at the first status other than SEC_S_OK and returns it.
+template <typename Visit> kx_int32_t walk_acltree(sec_acltree_t tree, Visit &&visit);
+
+namespace detail {
+template <typename Visit> kx_int32_t walk_in_order(sec_acltree_node_s *node, Visit &visit) {
+    if (!node)
+        return SEC_S_OK;
+    kx_int32_t rc = walk_in_order(node->sat_left, visit);
+    if (rc == SEC_S_OK && node->sat_acle)
+        rc = visit(node);
+    if (rc == SEC_S_OK)
+        rc = walk_in_order(node->sat_right, visit);
+    return rc;
+}
+} // namespace detail
+
+template <typename Visit> kx_int32_t walk_acltree(sec_acltree_t tree, Visit &&visit) {
+    if (!tree)
+        return SEC_S_OK;
+    if (tree->sat_type == SEC_ACLE_USER || tree->sat_type == SEC_ACLE_GROUP)
+        return detail::walk_in_order(tree->sat_root, visit);
+    for (sec_acltree_node_s *n = tree->sat_first; n; n = n->sat_next) {
+        if (!n->sat_acle)
+            continue;
+        kx_int32_t rc = visit(n);
+        if (rc != SEC_S_OK)
+            return rc;
+    }
+    return SEC_S_OK;
+}
+
+} // namespace kxacl
+
+#endif

@@ -1,0 +1,198 @@
+// Registration and levels of detail: defaults, KX_TRACE_LEVELS, run-time
+// changes, and the arguments the registry refuses.
+#include <array>
+#include <atomic>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <ostream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include <kx_tr.h>
+
+namespace {
+
+using levels_t = std::array<tr_detail_level_t, 5>; // Errors, API, Perf, Info, Buffer
+
+// Not in id order; Info's default is above 9, Buffer's below its minimum.
+constexpr tr_category_description_t categories[] = {
+    {2, "Perf", 3, 2}, {0, "Errors", 0, 0}, {3, "Info", 12, 0},
+    {1, "API", 1, 0},  {4, "Buffer", 0, 4},
+};
+constexpr levels_t defaults = {0, 1, 3, 9, 4};
+constexpr levels_t minimums = {0, 0, 2, 0, 4};
+constexpr levels_t untouched = {0xAA, 0xAA, 0xAA, 0xAA, 0xAA};
+
+class Levels : public ::testing::Test {
+  protected:
+    void SetUp() override { unsetenv("KX_TRACE_LEVELS"); }
+    void TearDown() override { tr_unregister_component_1("_TST"); }
+    int register_as(const char *name, levels_t &into) {
+        return tr_register_component_1(name, into.data(), categories, 5);
+    }
+    levels_t levels = untouched;
+};
+
+struct configured_case {
+    const char *configured;
+    levels_t expected;
+};
+
+void PrintTo(const configured_case &c, std::ostream *out) {
+    *out << '"' << c.configured << '"';
+}
+
+class ConfiguredLevels : public Levels, public ::testing::WithParamInterface<configured_case> {};
+
+TEST_P(ConfiguredLevels, AreAppliedAtRegistration) {
+    setenv("KX_TRACE_LEVELS", GetParam().configured, 1);
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    EXPECT_EQ(levels, GetParam().expected);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Env, ConfiguredLevels,
+    ::testing::Values(
+        configured_case{"", defaults}, configured_case{"_TST:api=8,PERF=6", {0, 8, 6, 9, 4}},
+        configured_case{"_SEL:API=8;_TST:Perf=7;_XYZ:*=1", {0, 1, 7, 9, 4}},
+        configured_case{"_TST:*=1,API=8", {1, 8, 2, 1, 4}},
+        configured_case{"_TST:API=8,*=1", {1, 1, 2, 1, 4}}, configured_case{"_TST:*=0", minimums},
+        configured_case{"_TST:*=7", {7, 7, 7, 7, 7}},
+        configured_case{"_TST:API=8;;_TST:,Errors=2,", {2, 8, 3, 9, 4}},
+        configured_case{" _TST : API = 8 ", {0, 8, 3, 9, 4}},
+        configured_case{"_TST:Unknown=5,API=6,Perf=", {0, 6, 3, 9, 4}},
+        configured_case{"_TST:API=12", {0, 9, 3, 9, 4}},
+        configured_case{"_TST:API=4294967296", {0, 9, 3, 9, 4}},
+        configured_case{"_TST:API=", defaults}, configured_case{"_TST", defaults},
+        configured_case{":::", defaults}, configured_case{"API=8", defaults},
+        configured_case{"_TST:API", defaults}, configured_case{"_TST:=5", defaults},
+        configured_case{"_TST:API=-1", defaults}, configured_case{"_TST:API=8x", defaults},
+        configured_case{"_TST:API=8:Perf=2", defaults}, configured_case{"_tst:API=8", defaults},
+        configured_case{"_TST2:API=8", defaults}, configured_case{"_TS:API=8", defaults}));
+
+// Generated strings of mostly the syntax's own characters never break
+// registration nor leave a level outside [minimum, 9]; a long one is read
+// to its end.
+TEST_F(Levels, GarbageAndOverlongConfigurationIsSafe) {
+    const std::string alphabet = "_TST:;,=*APIperf0123456789 ";
+    unsigned state = 12345;
+    auto next = [&] { return (state = state * 1103515245u + 12345u) >> 16; };
+    for (int round = 0; round < 2000; ++round) {
+        std::string configured;
+        for (unsigned n = next() % 64; n > 0; --n) {
+            const unsigned pick = next();
+            configured += pick % 8 ? alphabet[pick % alphabet.size()] : char(1 + pick % 255);
+        }
+        setenv("KX_TRACE_LEVELS", configured.c_str(), 1);
+        ASSERT_EQ(register_as("_TST", levels), TR_OK) << configured;
+        for (std::size_t i = 0; i < levels.size(); ++i)
+            ASSERT_TRUE(levels[i] >= minimums[i] && levels[i] <= 9) << configured;
+        ASSERT_EQ(tr_unregister_component_1("_TST"), TR_OK);
+    }
+    std::string overlong = "_TST:";
+    for (int i = 0; i < 20000; ++i)
+        overlong += "Unknown=1,";
+    setenv("KX_TRACE_LEVELS", (overlong + "API=6").c_str(), 1);
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    EXPECT_EQ(levels[1], 6);
+}
+
+TEST_F(Levels, SetChangesNamedCategoriesOfItsComponentOnly) {
+    levels_t other = untouched;
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    ASSERT_EQ(register_as("_TWO", other), TR_OK);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "api", 5), TR_OK);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "Perf", 0), TR_OK);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "Errors", 200), TR_OK);
+    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
+    EXPECT_EQ(tr_set_detail_level_1("_TWO", "*", 0), TR_OK);
+    EXPECT_EQ(other, minimums);
+    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
+    EXPECT_EQ(tr_unregister_component_1("_TWO"), TR_OK);
+}
+
+TEST_F(Levels, SetRefusesWhatItCannotNameAndKeepsErrno) {
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    errno = 4242;
+    EXPECT_EQ(tr_set_detail_level_1("_tst", "API", 5), TR_NOT_REGISTERED);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "Nope", 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "", 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_set_detail_level_1(nullptr, "API", 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", nullptr, 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(errno, 4242);
+    EXPECT_EQ(levels, defaults);
+}
+
+// The registry keeps its own copies of the names.
+TEST_F(Levels, RegistrationCopiesTheNames) {
+    char component[] = "_TST", api[] = "API";
+    const tr_category_description_t described[] = {{0, api, 1, 0}};
+    tr_detail_level_t level = 0xAA;
+    ASSERT_EQ(tr_register_component_1(component, &level, described, 1), TR_OK);
+    std::strcpy(component, "_XXX");
+    std::strcpy(api, "XYZ");
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "API", 4), TR_OK);
+    EXPECT_EQ(level, 4);
+}
+
+// Clients read levels without locks while they change; ThreadSanitizer
+// checks that the library's stores are atomic.
+TEST_F(Levels, ReadersSeeOnlyWholeLevelsWhileTheyChange) {
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    ASSERT_EQ(tr_set_detail_level_1("_TST", "API", 2), TR_OK);
+    std::atomic<bool> done{false};
+    std::atomic<int> odd_reads{0}, failed_sets{0};
+    std::vector<std::thread> readers;
+    for (int r = 0; r < 3; ++r)
+        readers.emplace_back([&] {
+            while (!done) {
+                const auto api = __atomic_load_n(&levels[1], __ATOMIC_RELAXED);
+                odd_reads += api != 2 && api != 8;
+            }
+        });
+    for (int i = 0; i < 20000; ++i)
+        failed_sets += tr_set_detail_level_1("_TST", "API", i % 2 ? 8 : 2) != TR_OK;
+    done = true;
+    for (auto &t : readers)
+        t.join();
+    EXPECT_EQ(failed_sets, 0);
+    EXPECT_EQ(odd_reads, 0);
+}
+
+TEST_F(Levels, RegisterUnregisterAndRegisterAgain) {
+    levels_t second = untouched;
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    EXPECT_EQ(register_as("_TST", second), TR_ALREADY_REGISTERED);
+    EXPECT_EQ(second, untouched);
+    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_OK);
+    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_NOT_REGISTERED);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "*", 7), TR_NOT_REGISTERED);
+    EXPECT_EQ(levels, defaults); // no longer written
+    setenv("KX_TRACE_LEVELS", "_TST:Errors=5", 1);
+    ASSERT_EQ(register_as("_TST", second), TR_OK);
+    EXPECT_EQ(second, (levels_t{5, 1, 3, 9, 4}));
+    EXPECT_EQ(tr_unregister_component_1(nullptr), TR_BAD_ARGUMENT);
+}
+
+TEST_F(Levels, BadRegistrationsAreRefusedWithoutEffect) {
+    const tr_category_description_t id_too_big[] = {{0, "A", 1, 0}, {2, "B", 1, 0}};
+    const tr_category_description_t no_name[] = {{0, nullptr, 1, 0}};
+    tr_detail_level_t *into = levels.data();
+    errno = 4242;
+    for (const char *bad : {static_cast<const char *>(nullptr), "", "_T T", "_T\nT"})
+        EXPECT_EQ(tr_register_component_1(bad, into, categories, 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_register_component_1("_TST", nullptr, categories, 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_register_component_1("_TST", into, nullptr, 5), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_register_component_1("_TST", into, categories, 0), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_register_component_1("_TST", into, id_too_big, 2), TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_register_component_1("_TST", into, no_name, 1), TR_BAD_ARGUMENT);
+    EXPECT_EQ(errno, 4242);
+    EXPECT_EQ(levels, untouched);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "*", 1), TR_NOT_REGISTERED);
+}
+
+} // namespace

@@ -1,0 +1,260 @@
+// Trace records read back from KX_TRACE_FILE: the line format, item bytes,
+// whole lines from concurrent threads, and dropped or failed records. The
+// file is opened once per process, so each case needs its own process (as
+// ctest runs them).
+#include <atomic>
+#include <bit>
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <string>
+#include <thread>
+#include <tuple>
+#include <utility>
+#include <vector>
+
+#include <signal.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <kx_tr.h>
+
+#include "tr_test_util.h"
+
+namespace {
+
+using tr_test::hex_of;
+using tr_test::read_lines;
+using tr_test::read_records;
+using strings = std::vector<std::string>;
+// A length, typed as the C API reads it from the variadic arguments.
+constexpr kx_uint32_t u32(kx_uint32_t n) {
+    return n;
+}
+
+class Records : public ::testing::Test {
+  protected:
+    void SetUp() override { setenv("KX_TRACE_FILE", trace.c_str(), 1); }
+    tr_test::scratch_dir dir;
+    std::string trace = dir.file("trace.out");
+};
+
+long long nanoseconds_of(long long seconds, long long nanoseconds) {
+    return seconds * 1000000000 + nanoseconds;
+}
+
+TEST_F(Records, LinesCarryTimeThreadComponentIdAndHexItems) {
+    timespec before{}, after{};
+    clock_gettime(CLOCK_REALTIME, &before);
+    ASSERT_EQ(tr_record_id_1("_TST", 42), TR_OK);
+    const kx_int32_t eight = 8;
+    const unsigned char raw[] = {0x08, 0x00, 0xa0, 0xff};
+    ASSERT_EQ(tr_record_data_1("_NOBODY", UINT32_MAX, 5, raw, u32(4), &eight, u32(4), "ab", u32(3),
+                               raw, u32(0), nullptr, u32(5)),
+              TR_OK);
+    clock_gettime(CLOCK_REALTIME, &after);
+
+    const auto lines = read_lines(trace);
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_TRUE(lines[0].ends_with(" _TST 42")) << lines[0];
+    const auto r = read_records(trace);
+    ASSERT_EQ(r.size(), 2u);
+    EXPECT_GE(nanoseconds_of(r[0].seconds, r[0].nanoseconds),
+              nanoseconds_of(before.tv_sec, before.tv_nsec));
+    EXPECT_LE(nanoseconds_of(r[1].seconds, r[1].nanoseconds),
+              nanoseconds_of(after.tv_sec, after.tv_nsec));
+    EXPECT_EQ(r[0].thread, gettid());
+    EXPECT_TRUE(r[0].items.empty());
+    EXPECT_EQ(r[1].component, "_NOBODY"); // need not be registered
+    EXPECT_EQ(r[1].id, 4294967295u);
+    const char *eight_hex = std::endian::native == std::endian::little ? "08000000" : "00000008";
+    EXPECT_EQ(r[1].items, (strings{"0800a0ff", eight_hex, "616200", "-", "-"}));
+}
+
+// Records count items of 16 bytes, the i-th at bytes + 16 * i.
+template <std::size_t... I>
+int record_16_byte_items(const unsigned char *bytes, kx_uint32_t count, std::index_sequence<I...>) {
+    auto pairs =
+        std::tuple_cat(std::make_tuple(static_cast<const void *>(bytes + 16 * I), u32(16))...);
+    return std::apply([&](auto... pair) { return tr_record_data_1("_TST", 64, count, pair...); },
+                      pairs);
+}
+
+// Item sizes across the point where a record outgrows the stack buffer,
+// every byte value (i * 7 + 3 runs through all 256), and the most items a
+// record takes.
+TEST_F(Records, ItemsOfAnySizeAndCountAreWrittenWhole) {
+    std::vector<unsigned char> bytes(6000);
+    for (std::size_t i = 0; i < bytes.size(); ++i)
+        bytes[i] = static_cast<unsigned char>(i * 7 + 3);
+    std::vector<kx_uint32_t> lengths = {256, 6000};
+    for (kx_uint32_t n = 440; n < 520; ++n)
+        lengths.push_back(n);
+    for (kx_uint32_t n : lengths)
+        ASSERT_EQ(tr_record_data_1("_TST", n, 2, bytes.data(), n, "z", u32(2)), TR_OK);
+    EXPECT_EQ(record_16_byte_items(bytes.data(), 64, std::make_index_sequence<64>()), TR_OK);
+    EXPECT_EQ(record_16_byte_items(bytes.data(), 65, std::make_index_sequence<65>()),
+              TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_record_data_1("_TST", 1, UINT32_MAX), TR_BAD_ARGUMENT); // reads no argument
+
+    const auto r = read_records(trace);
+    ASSERT_EQ(r.size(), lengths.size() + 1);
+    for (std::size_t i = 0; i < lengths.size(); ++i)
+        EXPECT_EQ(r[i].items, (strings{hex_of(bytes.data(), lengths[i]), "7a00"})) << lengths[i];
+    ASSERT_EQ(r.back().items.size(), 64u);
+    for (std::size_t i = 0; i < 64; ++i)
+        EXPECT_EQ(r.back().items[i], hex_of(&bytes[16 * i], 16)) << i;
+}
+
+TEST_F(Records, RecordsAppendInOrder) {
+    std::ofstream(trace) << "earlier\n";
+    ASSERT_EQ(tr_record_id_1("_TST", 1), TR_OK);
+    ASSERT_EQ(tr_record_id_1("_TST", 2), TR_OK);
+    const auto lines = read_lines(trace);
+    ASSERT_EQ(lines.size(), 3u);
+    EXPECT_EQ(lines[0], "earlier");
+    EXPECT_TRUE(lines[1].ends_with(" _TST 1") && lines[2].ends_with(" _TST 2"));
+}
+
+TEST_F(Records, NewFileHasMode0644) {
+    const mode_t saved = umask(0);
+    const int rc = tr_record_id_1("_TST", 1);
+    umask(saved);
+    ASSERT_EQ(rc, TR_OK);
+    struct stat info {};
+    ASSERT_EQ(stat(trace.c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 07777, 0644u);
+}
+
+TEST_F(Records, BadComponentsAreRefusedAndErrnoIsKept) {
+    errno = 4242;
+    for (const char *bad : {static_cast<const char *>(nullptr), "", "a b", "a\tb", "a\nb"}) {
+        EXPECT_EQ(tr_record_id_1(bad, 1), TR_BAD_ARGUMENT);
+        EXPECT_EQ(tr_record_data_1(bad, 1, 1, "x", u32(1)), TR_BAD_ARGUMENT);
+    }
+    EXPECT_EQ(tr_record_data_1("_TST", 2, 1, "x", u32(1)), TR_OK);
+    EXPECT_EQ(errno, 4242);
+    EXPECT_EQ(read_lines(trace).size(), 1u);
+}
+
+// Every record from threads writing at once comes out as one whole line.
+TEST_F(Records, ConcurrentRecordsStayWholeLines) {
+    constexpr kx_uint32_t threads = 8, per_thread = 400;
+    auto payload_of = [](kx_uint32_t t, kx_uint32_t seq) {
+        std::vector<unsigned char> bytes((t * 131 + seq * 17) % 1500); // some beyond the stack
+        for (std::size_t i = 0; i < bytes.size(); ++i)
+            bytes[i] = static_cast<unsigned char>(t + seq + i);
+        return bytes;
+    };
+    std::vector<long long> thread_ids(threads);
+    std::atomic<int> failures{0};
+    std::vector<std::thread> workers;
+    for (kx_uint32_t t = 0; t < threads; ++t)
+        workers.emplace_back([&, t] {
+            thread_ids[t] = gettid();
+            for (kx_uint32_t seq = 0; seq < per_thread; ++seq) {
+                const auto p = payload_of(t, seq);
+                failures += tr_record_data_1("_TST", t, 2, &seq, u32(4), p.data(),
+                                             static_cast<kx_uint32_t>(p.size())) != TR_OK;
+            }
+        });
+    for (auto &w : workers)
+        w.join();
+    EXPECT_EQ(failures, 0);
+
+    ASSERT_EQ(read_lines(trace).size(), threads * per_thread);
+    const auto records = read_records(trace);
+    ASSERT_EQ(records.size(), threads * per_thread);
+    std::set<std::pair<kx_uint32_t, kx_uint32_t>> seen;
+    for (const auto &r : records) {
+        ASSERT_LT(r.id, threads);
+        ASSERT_EQ(r.items.size(), 2u);
+        const auto t = static_cast<kx_uint32_t>(r.id);
+        ASSERT_EQ(r.items[0].size(), 8u);
+        unsigned char seq_bytes[4];
+        for (int i = 0; i < 4; ++i)
+            seq_bytes[i] =
+                static_cast<unsigned char>(std::stoul(r.items[0].substr(2 * i, 2), nullptr, 16));
+        kx_uint32_t seq;
+        std::memcpy(&seq, seq_bytes, sizeof seq);
+        ASSERT_LT(seq, per_thread);
+        const auto p = payload_of(t, seq);
+        EXPECT_EQ(r.items[1], hex_of(p.data(), p.size()));
+        EXPECT_EQ(r.thread, thread_ids[t]);
+        EXPECT_TRUE(seen.insert({t, seq}).second) << "twice: " << t << "/" << seq;
+    }
+}
+
+// --- without a usable trace file ---------------------------------------------
+
+// Records succeed and leave no file, not even in the working directory.
+void expect_records_dropped() {
+    tr_test::scratch_dir dir;
+    const auto saved = std::filesystem::current_path();
+    std::filesystem::current_path(dir.path);
+    EXPECT_EQ(tr_record_id_1("_TST", 1), TR_OK);
+    EXPECT_EQ(tr_record_data_1("_TST", 2, 1, "x", u32(1)), TR_OK);
+    std::filesystem::current_path(saved);
+    EXPECT_TRUE(std::filesystem::is_empty(dir.path));
+}
+
+TEST(Unrecorded, WithoutTraceFileRecordsAreDropped) {
+    unsetenv("KX_TRACE_FILE");
+    expect_records_dropped();
+}
+
+TEST(Unrecorded, EmptyTraceFileNameMeansNoFile) {
+    setenv("KX_TRACE_FILE", "", 1);
+    expect_records_dropped();
+}
+
+TEST(Unrecorded, UnopenableFileFailsEveryRecordAndKeepsErrno) {
+    tr_test::scratch_dir dir;
+    setenv("KX_TRACE_FILE", dir.file("missing/trace.out").c_str(), 1);
+    errno = 4242;
+    EXPECT_EQ(tr_record_id_1("_TST", 1), TR_WRITE_FAILED);
+    EXPECT_EQ(tr_record_data_1("_TST", 2, 1, "x", u32(1)), TR_WRITE_FAILED);
+    EXPECT_EQ(errno, 4242);
+}
+
+TEST(Unrecorded, FailedWriteIsReportedAndKeepsErrno) {
+    if (access("/dev/full", W_OK) != 0)
+        GTEST_SKIP() << "no writable /dev/full";
+    setenv("KX_TRACE_FILE", "/dev/full", 1);
+    errno = 4242;
+    EXPECT_EQ(tr_record_id_1("_TST", 1), TR_WRITE_FAILED);
+    EXPECT_EQ(errno, 4242);
+}
+
+// Opening a FIFO for writing waits for a reader; a trace point must not. The
+// record runs in a child, so that a hang fails the test, not the whole run.
+TEST(Unrecorded, FifoWithoutReaderDoesNotHang) {
+    tr_test::scratch_dir dir;
+    ASSERT_EQ(mkfifo(dir.file("fifo").c_str(), 0600), 0);
+    setenv("KX_TRACE_FILE", dir.file("fifo").c_str(), 1);
+    const pid_t child = fork();
+    ASSERT_GE(child, 0);
+    if (child == 0)
+        _exit(tr_record_id_1("_TST", 1));
+    int status = 0;
+    pid_t done = 0;
+    for (int tries = 0; tries < 200 && done == 0; ++tries)
+        if ((done = waitpid(child, &status, WNOHANG)) == 0)
+            usleep(50000);
+    if (done == 0) {
+        kill(child, SIGKILL);
+        waitpid(child, &status, 0);
+        FAIL() << "the record still waited after 10 s";
+    }
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), TR_WRITE_FAILED);
+}
+
+} // namespace
