@@ -26,6 +26,17 @@ header_state inspect_header(const sec_buffer_s &acl) {
     return header_state::ok;
 }
 
+kx_int32_t check_read_header(const sec_buffer_s &acl) {
+    switch (inspect_header(acl)) {
+    case header_state::ok:
+        return SEC_S_OK;
+    case header_state::foreign_order:
+        return report<MSG_2650_115>(SEC_S_BAD_ACL);
+    default:
+        return report<MSG_2650_109>(SEC_S_BAD_ACL);
+    }
+}
+
 std::uint16_t subacl_count(acl_bytes b) {
     return load_u16(b.data + layout::at_subacl_count);
 }

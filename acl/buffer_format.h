@@ -81,6 +81,10 @@ enum class header_state { ok, no_bytes, bad_type, bad_version, foreign_order };
 // that order. A buffer shorter than its header counts as having no bytes.
 header_state inspect_header(const sec_buffer_s &acl);
 
+// The header checks of the readers (listing, evaluation): a buffer they
+// cannot take is 2650-109, one of the other byte order 2650-115.
+kx_int32_t check_read_header(const sec_buffer_s &acl);
+
 std::uint16_t subacl_count(acl_bytes b);
 
 // One sub-ACL header, read within the buffer.

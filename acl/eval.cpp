@@ -118,18 +118,6 @@ constexpr const char group_routine[] = "sec__group_acles_perm";
 // two that are ignored.
 constexpr unsigned char entry_type_bits = 0x1F;
 
-// The descriptor and header checks of evaluation.
-kx_int32_t check_evaluated_header(const sec_buffer_s &acl) {
-    switch (inspect_header(acl)) {
-    case header_state::ok:
-        return SEC_S_OK;
-    case header_state::foreign_order:
-        return report<MSG_2650_115>(SEC_S_BAD_ACL);
-    default:
-        return report<MSG_2650_109>(SEC_S_BAD_ACL);
-    }
-}
-
 // 2650-147: nothing in the ACL answers the request. Messages show the whole
 // type byte, handler bit included.
 kx_int32_t no_entry(unsigned char type, const char *mech, const char *id) {
@@ -185,7 +173,7 @@ kx_int32_t check_single_request(sec_acl_buffer_t acl, unsigned char type, const 
         return bad_param(single_routine, 1, acl);
     if (!perm)
         return bad_param(single_routine, 6, perm);
-    kx_int32_t rc = check_evaluated_header(*acl);
+    kx_int32_t rc = check_read_header(*acl);
     if (rc != SEC_S_OK)
         return rc;
     unsigned t = type & entry_type_bits;
@@ -300,7 +288,7 @@ kx_int32_t check_group_request(sec_acl_buffer_t acl, kx_int32_t count, sec_buffe
         return bad_param(group_routine, 3, groups);
     if (!perm)
         return bad_param(group_routine, 4, perm);
-    return check_evaluated_header(*acl);
+    return check_read_header(*acl);
 }
 
 // Group entries stand in ascending order: each name walks from the first

@@ -22,18 +22,6 @@ bool is_empty_acl(const sec_buffer_s &acl) {
     return acl.length == 0 && !acl.value;
 }
 
-// The descriptor and header checks of the listing functions.
-kx_int32_t check_listed_header(const sec_buffer_s &acl) {
-    switch (inspect_header(acl)) {
-    case header_state::ok:
-        return SEC_S_OK;
-    case header_state::foreign_order:
-        return report<MSG_2650_115>(SEC_S_BAD_ACL);
-    default:
-        return report<MSG_2650_109>(SEC_S_BAD_ACL);
-    }
-}
-
 // Appends the entries of every sub-ACL that wanted() accepts, in buffer order.
 template <typename Wanted>
 kx_int32_t append_subacls(const sec_buffer_s &acl, sec_acle_list_t list, Wanted wanted) {
@@ -82,7 +70,7 @@ kx_int32_t list_acl(sec_acl_buffer_t acl, sec_acle_list_t list) {
         list->acles = nullptr;
         return SEC_S_OK;
     }
-    kx_int32_t rc = check_listed_header(*acl);
+    kx_int32_t rc = check_read_header(*acl);
     if (rc != SEC_S_OK)
         return rc;
     return fill_list(
@@ -104,7 +92,7 @@ kx_int32_t list_acl_by_type(sec_acl_buffer_t acl, unsigned char type, const char
         list->acles = nullptr;
         return SEC_S_OK;
     }
-    kx_int32_t rc = check_listed_header(*acl);
+    kx_int32_t rc = check_read_header(*acl);
     if (rc != SEC_S_OK)
         return rc;
     return fill_list(list, [&] {
