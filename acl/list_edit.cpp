@@ -50,10 +50,20 @@ void release_list(sec_acle_list_t list) {
     list->acles = nullptr;
 }
 
-// Fills the list, which is emptied again after a failure.
-template <typename Fill> kx_int32_t fill_list(sec_acle_list_t list, Fill fill) {
+// Fills the list from a checked buffer: the empty ACL lists as the empty
+// list; a buffer the readers cannot take leaves the list untouched; after a
+// failure of fill() the list is emptied again.
+template <typename Fill>
+kx_int32_t fill_list(const sec_buffer_s &acl, sec_acle_list_t list, Fill fill) {
+    if (!is_empty_acl(acl)) {
+        kx_int32_t rc = check_read_header(acl);
+        if (rc != SEC_S_OK)
+            return rc;
+    }
     list->count = 0;
     list->acles = nullptr;
+    if (is_empty_acl(acl))
+        return SEC_S_OK;
     kx_int32_t rc = fill();
     if (rc != SEC_S_OK)
         release_list(list);
@@ -65,16 +75,9 @@ kx_int32_t list_acl(sec_acl_buffer_t acl, sec_acle_list_t list) {
         return bad_param("sec_list_acl", 1, acl);
     if (!list)
         return bad_param("sec_list_acl", 2, list);
-    if (is_empty_acl(*acl)) {
-        list->count = 0;
-        list->acles = nullptr;
-        return SEC_S_OK;
-    }
-    kx_int32_t rc = check_read_header(*acl);
-    if (rc != SEC_S_OK)
-        return rc;
-    return fill_list(
-        list, [&] { return append_subacls(*acl, list, [](const subacl_view &) { return true; }); });
+    return fill_list(*acl, list, [&] {
+        return append_subacls(*acl, list, [](const subacl_view &) { return true; });
+    });
 }
 
 kx_int32_t list_acl_by_type(sec_acl_buffer_t acl, unsigned char type, const char *mech,
@@ -87,15 +90,7 @@ kx_int32_t list_acl_by_type(sec_acl_buffer_t acl, unsigned char type, const char
         return bad_param("sec_list_acl_by_type", 3, mech);
     if (!list)
         return bad_param("sec_list_acl_by_type", 4, list);
-    if (is_empty_acl(*acl)) {
-        list->count = 0;
-        list->acles = nullptr;
-        return SEC_S_OK;
-    }
-    kx_int32_t rc = check_read_header(*acl);
-    if (rc != SEC_S_OK)
-        return rc;
-    return fill_list(list, [&] {
+    return fill_list(*acl, list, [&] {
         if (type_has_mech(type) && !mech)
             return append_subacls(*acl, list,
                                   [type](const subacl_view &v) { return v.type == type; });
