@@ -250,6 +250,8 @@ kx_int32_t add_acle(sec_boolean_t noupdate, sec_acle_t acle, sec_acl_buffer_t ac
     bool removed = false;
     if (rc == SEC_S_OK) {
         rc = write_back(*acl, s, "sec_add_acle_to_acl", &removed);
+        // An insertion always leaves an entry to write; should none come out,
+        // that is our fault, and no callee gave a code to show, hence 0.
         if (rc == SEC_S_OK && removed)
             rc = internal_error(here(src_acl), 0);
     }
