@@ -76,12 +76,12 @@ kx_int32_t subacl_length(sec_acltree_t tree, std::size_t *length) {
     return rc;
 }
 
-// Writes the tree's sub-ACL of the given length at out.
-void write_subacl(sec_acltree_t tree, std::size_t length, unsigned char *out) {
-    std::memset(out, 0, length);
-    store_u32(out + layout::at_subacl_length, static_cast<std::uint32_t>(length));
-    out[layout::at_subacl_type] = tree->sat_type;
+// Writes the sub-ACL of a tree that holds entries at out, in one walk, and
+// gives its length (the one that subacl_length gave to size out).
+std::size_t write_subacl(sec_acltree_t tree, unsigned char *out) {
     std::size_t offset = subacl_header_length(tree);
+    std::memset(out, 0, offset);
+    out[layout::at_subacl_type] = tree->sat_type;
     if (type_has_mech(tree->sat_type)) {
         out[layout::at_mech_length] = static_cast<unsigned char>(offset - layout::at_mech);
         std::memcpy(out + layout::at_mech, tree->sat_mech, offset - layout::at_mech);
@@ -90,18 +90,19 @@ void write_subacl(sec_acltree_t tree, std::size_t length, unsigned char *out) {
     walk_acltree(tree, [&](sec_acltree_node_s *n) {
         const sec_acle_t acle = n->sat_acle;
         unsigned char *record = out + offset;
+        std::size_t id_length = type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0;
         record[layout::at_acle_version] = layout::acle_version;
         store_u32(record + layout::at_perm, acle->perm);
-        if (type_has_id(acle->type)) {
-            std::size_t id_length = std::strlen(acle->id) + 1;
-            store_u16(record + layout::at_id_length, static_cast<std::uint16_t>(id_length));
+        store_u16(record + layout::at_id_length, static_cast<std::uint16_t>(id_length));
+        if (id_length)
             std::memcpy(record + layout::at_id, acle->id, id_length);
-        }
-        offset += record_length(acle);
+        offset += layout::acle_header_size + id_length;
         ++count;
         return SEC_S_OK;
     });
+    store_u32(out + layout::at_subacl_length, static_cast<std::uint32_t>(offset));
     store_u32(out + layout::at_acle_count, count);
+    return offset;
 }
 
 } // namespace
@@ -138,7 +139,7 @@ kx_int32_t sec__acltree_to_subacl(const sec_acltree_t tree, unsigned char **suba
     auto *out = static_cast<unsigned char *>(mem_alloc(*length));
     if (!out)
         return no_memory("sec__acltree_to_subacl", *length);
-    write_subacl(tree, *length, out);
+    write_subacl(tree, out);
     *subacl = out;
     return SEC_S_OK;
 }
@@ -168,13 +169,9 @@ kx_int32_t sec__acltrees_to_acl(sec_acltree_t *acltrees, kx_int32_t count, sec_a
     }
     store_u16(out + layout::at_subacl_count, static_cast<std::uint16_t>(subacls));
     std::size_t offset = layout::header_size;
-    for (kx_int32_t i = count - 1; i >= 0; --i) {
-        std::size_t length = 0;
-        subacl_length(acltrees[i], &length);
-        if (length > 0)
-            write_subacl(acltrees[i], length, out + offset);
-        offset += length;
-    }
+    for (kx_int32_t i = count - 1; i >= 0; --i)
+        if (tree_has_entry(acltrees[i]))
+            offset += write_subacl(acltrees[i], out + offset);
     acl->value = out;
     acl->length = static_cast<kx_int32_t>(total);
     return SEC_S_OK;

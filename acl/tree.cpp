@@ -262,6 +262,14 @@ void free_acltrees(sec_acltree_t *trees, int count) {
     std::free(trees);
 }
 
+bool tree_has_entry(sec_acltree_t tree) {
+    if (tree)
+        for (node *n = tree->sat_first; n; n = n->sat_next)
+            if (n->sat_acle)
+                return true;
+    return false;
+}
+
 std::size_t tree_entry_count(sec_acltree_t tree) {
     std::size_t count = 0;
     if (tree)

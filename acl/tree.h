@@ -53,6 +53,9 @@ void sec__free_acltree(sec_acltree_t tree);
 // Frees an array of trees, from the last to the first, and the array.
 void free_acltrees(sec_acltree_t *trees, int count);
 
+// Whether any node still holds an entry.
+bool tree_has_entry(sec_acltree_t tree);
+
 // Number of nodes that still hold an entry.
 std::size_t tree_entry_count(sec_acltree_t tree);
 
