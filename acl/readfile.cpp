@@ -16,6 +16,7 @@
 #include "frame.h"
 #include "parse.h"
 #include "report.h"
+#include "syscalls.h"
 #include "tree.h"
 
 namespace kxacl {
@@ -87,7 +88,7 @@ kx_int32_t examine_acl_file(read_call &c) {
     kx_int32_t rc = sec__get_aclfname(c.filename, c.username, c.aclpath, &c.uid);
     if (rc != SEC_S_OK)
         return rc;
-    int err = stat(c.aclpath, &c.acl_st) != 0 ? errno : 0;
+    int err = sys_stat(c.aclpath, &c.acl_st) != 0 ? errno : 0;
     if (timer.wanted())
         trace_perf(1, c.aclpath, timer);
     if (err != 0 || !S_ISREG(c.acl_st.st_mode))
@@ -131,7 +132,7 @@ bool cacl_trusted(read_call &c) {
 int open_source(const char *source, bool is_cacl) {
     int flags = O_RDONLY | O_NONBLOCK | O_CLOEXEC | (is_cacl ? O_NOFOLLOW : 0);
     perf_timer timer(perf_at(2));
-    int fd = open(source, flags);
+    int fd = sys_open(source, flags);
     if (fd < 0) {
         int err = errno;
         if (info_traced())
@@ -147,7 +148,7 @@ struct descriptor {
     int fd;
     ~descriptor() {
         if (fd >= 0)
-            close(fd);
+            sys_close(fd);
     }
 };
 
@@ -159,7 +160,7 @@ bool opened_file_acceptable(const read_call &c, int fd, bool is_cacl) {
     if (!is_cacl && !c.username)
         return true;
     struct stat st;
-    if (fstat(fd, &st) != 0)
+    if (sys_fstat(fd, &st) != 0)
         return false;
     if (is_cacl)
         return cacl_matches_acl(c.acl_st, st);
