@@ -191,8 +191,34 @@ kx_int32_t splice(sec_buffer_s &acl, std::size_t offset, std::size_t old_length,
     return SEC_S_OK;
 }
 
+// Where a new sub-ACL goes: right after the last sub-ACL, ahead of any
+// bytes that follow it (validation leaves those alone), so that a walk by
+// the sub-ACL lengths reaches it. False when the last sub-ACL's records do
+// not end where its length says: validation compares the two only for a
+// sub-ACL that another one follows, so one added after it would make the
+// buffer invalid.
+bool end_of_subacls(const sec_buffer_s &acl, std::size_t *end) {
+    acl_bytes b = bytes_of(acl);
+    unsigned count = subacl_count(b);
+    *end = layout::header_size;
+    if (count == 0)
+        return true;
+    subacl_view v;
+    for (unsigned i = 0; i < count; ++i, *end = v.end())
+        if (!read_subacl(b, *end, &v))
+            return false;
+    std::size_t records_end = v.first_entry;
+    for (std::uint32_t n = 0; n < v.count && records_end <= *end; ++n) {
+        acle_view e;
+        if (!read_acle(b, records_end, &e))
+            return false;
+        records_end = e.next;
+    }
+    return records_end == *end && *end <= b.size;
+}
+
 // The sub-ACL of acle's key written back after a change; when the buffer
-// had none, it is appended and counted.
+// had none, it is added after the others and counted.
 kx_int32_t write_back(sec_buffer_s &acl, const edited_subacl &s, const char *routine,
                       bool *removed) {
     unsigned char *fresh = nullptr;
@@ -205,7 +231,10 @@ kx_int32_t write_back(sec_buffer_s &acl, const edited_subacl &s, const char *rou
     if (!s.found) {
         if (stored_subacl_count(acl) == layout::max_subacls)
             return no_memory(routine, static_cast<std::size_t>(acl.length) + fresh_length);
-        rc = splice(acl, static_cast<std::size_t>(acl.length), 0, fresh, fresh_length, routine);
+        std::size_t end = 0;
+        if (!end_of_subacls(acl, &end))
+            return report_corrupt(here(src_acl));
+        rc = splice(acl, end, 0, fresh, fresh_length, routine);
         if (rc == SEC_S_OK)
             set_subacl_count(acl, static_cast<std::uint16_t>(stored_subacl_count(acl) + 1));
         return rc;
