@@ -33,7 +33,8 @@ kx_int32_t append_subacls(const sec_buffer_s &acl, sec_acle_list_t list, Wanted 
         if (!read_subacl(b, offset, &v))
             return report_corrupt(here(src_acl));
         if (wanted(v)) {
-            kx_int32_t rc = append_subacl_to_list(b, v, list);
+            acl_bytes records = subacl_records_bytes(b, v, i + 1 == count);
+            kx_int32_t rc = append_subacl_to_list(records, v, list);
             if (rc != SEC_S_OK)
                 return rc;
         }
