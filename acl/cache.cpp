@@ -300,13 +300,13 @@ cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl) {
     if (sys_lstat(cacl, &v.cacl_st) != 0) {
         v.state = cacl_state::unexaminable;
         v.err = errno;
-    } else if (!S_ISREG(v.cacl_st.st_mode)) {
-        v.state = cacl_state::foreign;
-    } else if (v.cacl_st.st_size <= 0 ||
-               static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
-               v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec) {
+    } else if (S_ISREG(v.cacl_st.st_mode) &&
+               (v.cacl_st.st_size <= 0 ||
+                static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
+                v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec)) {
         v.state = cacl_state::stale;
     } else if (!cacl_matches_acl(acl_st, v.cacl_st)) {
+        // Not a regular file, or another owner, group or permission bits.
         v.state = cacl_state::foreign;
     }
     return v;

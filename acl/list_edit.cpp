@@ -334,7 +334,7 @@ void trace_edit_entry(kx_uint32_t id, sec_acle_t acle, sec_acl_buffer_t acl) {
 }
 
 kx_int32_t add_acle_framed(sec_boolean_t noupdate, sec_acle_t acle, sec_acl_buffer_t acl) {
-    const api_points &points = api_add_acle_to_acl;
+    constexpr api_points points = api_add_acle_to_acl;
     api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
     return api_leave(points, add_acle(noupdate, acle, acl));
 }
@@ -352,7 +352,7 @@ using namespace kxacl;
 
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl,
                                               sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_list_acl;
+    constexpr api_points points = api_list_acl;
     api_enter(points, clears_record::yes, [&] {
         if (acl)
             trace_data(points.entry_data, num(acl->length), num(acl->value), num(aclelist));
@@ -369,7 +369,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl,
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsigned char type,
                                                       char *mech,
                                                       sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_list_acl_by_type;
+    constexpr api_points points = api_list_acl_by_type;
     api_enter(points, clears_record::yes, [&] {
         kx_uint32_t wide_type = type;
         if (acl)
@@ -387,7 +387,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsi
 }
 
 extern "C" ACL_EXTERN void sec_release_aclelist(sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_release_aclelist;
+    constexpr api_points points = api_release_aclelist;
     api_enter(points, clears_record::no, [&] {
         kx_int32_t count = list_count(aclelist);
         trace_data(points.entry_data, num(aclelist), num(count));
@@ -409,7 +409,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_add_acle_to_acl2(sec_acle_t acle,
 
 extern "C" ACL_EXTERN kx_int32_t sec_del_acle_from_acl(sec_acle_t acle,
                                                        sec_acl_buffer_t acl) noexcept {
-    const api_points &points = api_del_acle_from_acl;
+    constexpr api_points points = api_del_acle_from_acl;
     api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
     return api_leave(points, del_acle(acle, acl));
 }
