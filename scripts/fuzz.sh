@@ -34,11 +34,13 @@ target_line() {
 }
 
 # Options every run shares: the input limit, the dictionary, where failing
-# inputs go; an input that runs for 10 s counts as a hang.
+# inputs go, and how long one input may run before it counts as a hang
+# (the slowest inputs known take half a second; a long run on a busy
+# machine gets more room).
 common_options() {
-  local name=$1 max_len=$2
+  local name=$1 max_len=$2 timeout=$3
   mkdir -p "$artifacts"
-  echo "-max_len=$max_len -timeout=10 -artifact_prefix=$artifacts/$name- -print_final_stats=1"
+  echo "-max_len=$max_len -timeout=$timeout -artifact_prefix=$artifacts/$name- -print_final_stats=1"
   [ -f "$root/fuzz/$name.dict" ] && echo "-dict=$root/fuzz/$name.dict"
   return 0
 }
@@ -48,7 +50,7 @@ short_run() {
   work=$(mktemp -d)
   cp -r "$root/fuzz/corpus/$name/." "$work/"
   # shellcheck disable=SC2046
-  "$binary" -runs="$runs" -seed=1 $(common_options "$name" "$max_len") "$work" || status=$?
+  "$binary" -runs="$runs" -seed=1 $(common_options "$name" "$max_len" 10) "$work" || status=$?
   rm -rf "$work"
   return "$status"
 }
@@ -60,7 +62,7 @@ long_run() {
   mkdir -p "$corpus"
   cp -rn "$root/fuzz/corpus/$name/." "$corpus/"
   # shellcheck disable=SC2046
-  "$tree/fuzz/$name" -max_total_time="$seconds" $(common_options "$name" "$max_len") "$corpus"
+  "$tree/fuzz/$name" -max_total_time="$seconds" $(common_options "$name" "$max_len" 60) "$corpus"
 }
 
 case "${1:-}" in
