@@ -1,7 +1,9 @@
 #!/usr/bin/env bash
 # Installs what is needed, then builds and runs the whole test suite: once
-# plainly and once under AddressSanitizer and UndefinedBehaviorSanitizer;
-# then the concurrency tests alone under ThreadSanitizer.
+# plainly and again under valgrind memcheck; under AddressSanitizer and
+# UndefinedBehaviorSanitizer; the concurrency tests alone under
+# ThreadSanitizer; every fuzz target for a short fixed number of runs; and
+# the static analysis (clang-tidy and cppcheck).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
@@ -15,6 +17,14 @@ run_tree() {
 }
 
 run_tree build
+
+# The plain tree's tests again, each under valgrind memcheck: any error or
+# definite leak fails the test. The out-of-memory tests replace malloc,
+# which valgrind replaces itself, so they are left out.
+(cd build && ctest -T memcheck --output-on-failure --timeout 900 -j"$jobs" -E '^OutOfMemoryTest\.' \
+  --overwrite MemoryCheckCommand="$(command -v valgrind)" \
+  --overwrite "MemoryCheckCommandOptions=--error-exitcode=1 --leak-check=full --errors-for-leak-kinds=definite,indirect --suppressions=$PWD/tests/valgrind.supp")
+
 ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
   run_tree build-asan -DKX_SANITIZE=ON
 
@@ -22,3 +32,8 @@ ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:ha
 cmake -S . -B build-tsan -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKX_TSAN=ON >/dev/null
 cmake --build build-tsan -j"$jobs" --target acl_thread_tests
 (cd build-tsan && TSAN_OPTIONS=halt_on_error=1 ctest --output-on-failure -j"$jobs" -R 'Threads|threads')
+
+# Each fuzz target's short run (fuzz/CMakeLists.txt sets how many inputs).
+scripts/fuzz.sh check
+
+scripts/lint.sh
