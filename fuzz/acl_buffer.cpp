@@ -2,8 +2,7 @@
 #include "acl_exercise.h"
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
-    kxfuzz::trace_to_null();
-    kxfuzz::register_handlers();
+    kxfuzz::prepare_process();
     return 0;
 }
 

@@ -53,8 +53,7 @@ void convert_back_and_forth(std::vector<unsigned char> host) {
 } // namespace
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
-    kxfuzz::trace_to_null();
-    kxfuzz::register_handlers();
+    kxfuzz::prepare_process();
     return 0;
 }
 

@@ -46,6 +46,12 @@ inline void register_handlers() {
             "sec__register_id_handler");
 }
 
+// What every buffer target does once, from LLVMFuzzerInitialize.
+inline void prepare_process() {
+    trace_to_null();
+    register_handlers();
+}
+
 // Readers and edits look at this many listed entries at most, so that a
 // long buffer does not make one input run for seconds.
 inline constexpr std::size_t entries_examined = 48;

@@ -132,8 +132,7 @@ void expect_canonical(const std::vector<unsigned char> &bytes) {
 } // namespace
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
-    trace_to_null();
-    register_handlers();
+    prepare_process();
     make_dir();
     return 0;
 }

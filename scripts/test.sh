@@ -8,6 +8,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
 jobs="$(nproc)"
+suppressions="$PWD/tests/valgrind.supp"
 
 run_tree() {
   local dir="$1"; shift
@@ -23,7 +24,7 @@ run_tree build
 # which valgrind replaces itself, so they are left out.
 (cd build && ctest -T memcheck --output-on-failure --timeout 900 -j"$jobs" -E '^OutOfMemoryTest\.' \
   --overwrite MemoryCheckCommand="$(command -v valgrind)" \
-  --overwrite "MemoryCheckCommandOptions=--error-exitcode=1 --leak-check=full --errors-for-leak-kinds=definite,indirect --suppressions=$PWD/tests/valgrind.supp")
+  --overwrite "MemoryCheckCommandOptions=--error-exitcode=1 --leak-check=full --errors-for-leak-kinds=definite,indirect --suppressions=$suppressions")
 
 ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
   run_tree build-asan -DKX_SANITIZE=ON
