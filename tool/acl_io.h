@@ -3,6 +3,7 @@
 #ifndef KXACL_TOOL_ACL_IO_H
 #define KXACL_TOOL_ACL_IO_H
 
+#include <cstdlib>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -37,7 +38,12 @@ class acl_buffer {
     acl_buffer() = default;
     acl_buffer(const acl_buffer &) = delete;
     acl_buffer &operator=(const acl_buffer &) = delete;
-    ~acl_buffer() { sec_release_acl(&buf_); }
+    // The library refuses to release bytes that are not an ACL buffer, such
+    // as a file that failed validation; they came from malloc all the same.
+    ~acl_buffer() {
+        if (sec_release_acl(&buf_) != SEC_S_OK)
+            std::free(buf_.value);
+    }
 
     sec_buffer_t get() { return &buf_; }
     const sec_buffer_s &bytes() const { return buf_; }
