@@ -37,10 +37,11 @@ class unique_fd {
     int fd_;
 };
 
-bool read_all(int fd, void *data, std::size_t size) {
-    auto *p = static_cast<unsigned char *>(data);
+// Moves all size bytes with read or write, across short transfers and
+// interruptions; false on an error or an early end of file.
+template <typename Byte, typename Io> bool transfer_all(int fd, Byte *p, std::size_t size, Io io) {
     while (size > 0) {
-        const ssize_t n = ::read(fd, p, size);
+        const ssize_t n = io(fd, p, size);
         if (n < 0 && errno == EINTR)
             continue;
         if (n <= 0)
@@ -50,19 +51,11 @@ bool read_all(int fd, void *data, std::size_t size) {
     }
     return true;
 }
-
+bool read_all(int fd, unsigned char *data, std::size_t size) {
+    return transfer_all(fd, data, size, ::read);
+}
 bool write_all(int fd, const void *data, std::size_t size) {
-    const auto *p = static_cast<const unsigned char *>(data);
-    while (size > 0) {
-        const ssize_t n = ::write(fd, p, size);
-        if (n < 0 && errno == EINTR)
-            continue;
-        if (n <= 0)
-            return false;
-        p += n;
-        size -= static_cast<std::size_t>(n);
-    }
-    return true;
+    return transfer_all(fd, static_cast<const unsigned char *>(data), size, ::write);
 }
 
 std::vector<unsigned char> read_file(const std::string &path) {
@@ -183,6 +176,11 @@ void load_acl(const invocation &inv, template_set &templates, unsigned flags, ac
     if (rflags)
         *rflags = out_flags;
     check_status(status);
+}
+
+acl_input::acl_input(const invocation &inv, unsigned flags, unsigned *rflags) {
+    load_templates(inv, templates);
+    load_acl(inv, templates, flags, acl, rflags);
 }
 
 void write_buffer_file(const std::string &path, const sec_buffer_s &acl) {

@@ -55,6 +55,14 @@ class acl_buffer {
 // The permission templates of the invocation: its file's, or the default.
 void load_templates(const invocation &inv, template_set &set);
 
+// The ACL that a reading command works on, with the templates of its file.
+struct acl_input {
+    template_set templates;
+    acl_buffer acl;
+    // Loads the templates and the ACL of inv (see load_acl).
+    acl_input(const invocation &inv, unsigned flags, unsigned *rflags = nullptr);
+};
+
 // Reads the ACL of inv.input, a text file (through the cached compiled
 // file when that is current) or a buffer file. flags are those of the
 // library's ACL file reader; rflags receives its result flags.

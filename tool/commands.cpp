@@ -210,16 +210,14 @@ int run_compile(const invocation &inv) {
     if (!inv.output.empty() && is_cache_name(inv.output))
         throw tool_error("refusing to write " + inv.output +
                          ": cached compiled files are written by the library only (use --cache)");
-    template_set templates;
-    load_templates(inv, templates);
-    acl_buffer acl;
     unsigned rflags = 0;
     invocation text = inv;
     text.kind = input_kind::text;
-    load_acl(text, templates, SEC_F_ACL_TEXT | (inv.cache ? SEC_F_ACL_CACHE : 0u), acl, &rflags);
+    acl_input in(text, SEC_F_ACL_TEXT | (inv.cache ? SEC_F_ACL_CACHE : 0u), &rflags);
+    acl_buffer &acl = in.acl;
     if (!inv.output.empty())
         write_buffer_file(inv.output, acl.bytes());
-    const auto entries = list_entries(invocation{}, acl, templates);
+    const auto entries = list_entries(invocation{}, acl, in.templates);
     const bool cached = (rflags & SEC_F_ACL_CACHE) != 0;
     if (inv.json) {
         json_writer json;
@@ -247,11 +245,8 @@ int run_compile(const invocation &inv) {
 }
 
 int run_list(const invocation &inv) {
-    template_set templates;
-    load_templates(inv, templates);
-    acl_buffer acl;
-    load_acl(inv, templates, SEC_F_ACL_CONVERT, acl);
-    const auto entries = list_entries(inv, acl, templates);
+    acl_input in(inv, SEC_F_ACL_CONVERT);
+    const auto entries = list_entries(inv, in.acl, in.templates);
     if (!inv.json) {
         print(entry_lines(entries));
         return exit_ok;
@@ -301,13 +296,10 @@ std::optional<std::uint32_t> evaluate(const identity &who, acl_buffer &acl) {
 }
 
 int run_check(const invocation &inv) {
-    template_set templates;
-    load_templates(inv, templates);
-    acl_buffer acl;
-    load_acl(inv, templates, SEC_F_ACL_CONVERT, acl);
-    const std::optional<std::uint32_t> mask = evaluate(inv.who, acl);
+    acl_input in(inv, SEC_F_ACL_CONVERT);
+    const std::optional<std::uint32_t> mask = evaluate(inv.who, in.acl);
     const std::uint32_t granted = mask.value_or(0);
-    const std::optional<std::string> perms = perm_string(granted, templates);
+    const std::optional<std::string> perms = perm_string(granted, in.templates);
     if (inv.json) {
         json_writer json;
         json.begin_object().key("entry").value(mask.has_value());
@@ -396,11 +388,8 @@ std::string capture_dump(acl_buffer &acl) {
 }
 
 int run_dump(const invocation &inv) {
-    template_set templates;
-    load_templates(inv, templates);
-    acl_buffer acl;
-    load_acl(inv, templates, SEC_F_ACL_CONVERT, acl);
-    const std::string text = capture_dump(acl);
+    acl_input in(inv, SEC_F_ACL_CONVERT);
+    const std::string text = capture_dump(in.acl);
     if (!inv.json) {
         print(text);
         return exit_ok;
