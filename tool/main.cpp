@@ -56,9 +56,19 @@ int run(int argc, char **argv) {
 
 } // namespace
 
+// A result that could not be written whole is a failure, not a success
+// with missing output (a full disk, a closed pipe).
+int flush_output(int status) {
+    if (std::fflush(stdout) != 0 || std::ferror(stdout)) {
+        std::fputs("kxacl: cannot write the output\n", stderr);
+        return exit_error;
+    }
+    return status;
+}
+
 int main(int argc, char **argv) {
     try {
-        return run(argc, argv);
+        return flush_output(run(argc, argv));
     } catch (const std::bad_alloc &) {
         std::fputs("kxacl: out of memory\n", stderr);
     } catch (const std::exception &e) {
