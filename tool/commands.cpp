@@ -8,6 +8,7 @@
 #include <cstring>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <fcntl.h>
@@ -79,27 +80,36 @@ std::optional<std::string> perm_string(std::uint32_t mask, template_set &templat
     return std::string(text);
 }
 
+// Whether arg is written as a mask: decimal digits, or 0x and hex digits.
+bool looks_like_mask(const std::string &arg) {
+    const bool hex = arg.starts_with("0x") || arg.starts_with("0X");
+    const std::string_view digits = std::string_view(arg).substr(hex ? 2 : 0);
+    return !digits.empty() && digits.find_first_not_of(hex ? "0123456789abcdefABCDEF"
+                                                           : "0123456789") == std::string::npos;
+}
+
+std::uint32_t parse_mask(const std::string &arg) {
+    if (!looks_like_mask(arg))
+        throw tool_error("'" + arg + "' is not a mask: write decimal digits, or 0x and hex digits");
+    const bool hex = arg.size() > 1 && (arg[1] == 'x' || arg[1] == 'X');
+    errno = 0;
+    const unsigned long long value = std::strtoull(arg.c_str(), nullptr, hex ? 16 : 10);
+    if (errno != 0 || value > 0xffffffffull)
+        throw tool_error("'" + arg + "' is not a 32-bit mask");
+    return static_cast<std::uint32_t>(value);
+}
+
 // A mask from a permission string, or from a number when the user gave one.
 std::uint32_t parse_perm_argument(const std::string &arg, perms_mode mode,
                                   template_set &templates) {
-    const bool numeric = !arg.empty() &&
-                         arg.find_first_not_of("0123456789abcdefxABCDEFX") == std::string::npos &&
-                         (arg[0] >= '0' && arg[0] <= '9');
-    if (mode == perms_mode::mask || (mode == perms_mode::detect && numeric)) {
-        errno = 0;
-        char *end = nullptr;
-        const unsigned long long value = std::strtoull(arg.c_str(), &end, 0);
-        if (arg.empty() || *end != '\0' || errno != 0 || value > 0xffffffffull || arg[0] == '-' ||
-            arg[0] == '+')
-            throw tool_error("'" + arg + "' is not a 32-bit mask");
-        return static_cast<std::uint32_t>(value);
-    }
+    if (mode == perms_mode::mask || (mode == perms_mode::detect && looks_like_mask(arg)))
+        return parse_mask(arg);
     kx_uint32_t mask = 0;
     check_status(sec_translate_perms(arg.c_str(), templates.get(), &mask));
     return mask;
 }
 
-// A texts that the library allocated, released with free.
+// A text that the library allocated, released with free.
 struct owned_text {
     char *p = nullptr;
     ~owned_text() { std::free(p); }

@@ -256,7 +256,9 @@ TEST_F(KxaclTool, DumpPrintsTheLibraryDumpOnStandardOutput) {
 TEST_F(KxaclTool, PermsTranslatesBothWays) {
     EXPECT_EQ(run_kxacl({"perms", "rwx"}).out, "rwx 0x0000000b\n");
     EXPECT_EQ(run_kxacl({"perms", "0xb"}).out, "rwx 0x0000000b\n");
-    EXPECT_EQ(run_kxacl({"perms", "11"}).out, "rwx 0x0000000b\n");
+    EXPECT_EQ(run_kxacl({"perms", "011"}).out, "rwx 0x0000000b\n"); // decimal, not octal
+    EXPECT_EQ(run_kxacl({"perms", "--mask", "0xz"}).err,
+              "kxacl: '0xz' is not a mask: write decimal digits, or 0x and hex digits\n");
     EXPECT_EQ(parsed(run_kxacl({"perms", "--json", "C"})),
               json::parse(R"({"perms":"C","mask":16})"));
     auto r = run_kxacl({"perms", "0x2000"});
