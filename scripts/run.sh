@@ -13,7 +13,7 @@ kxacl=build/tool/kxacl
 work="$(mktemp -d)"
 trap 'rm -rf "$work"' EXIT
 cp examples/resource.acl "$work/"
-touch -d '-2 seconds' "$work/resource.acl" # a text changed this second is not cached
+touch -d '-2 seconds' "$work/resource.acl" # a cache written in the text's second is not used
 acl="$work/resource.acl"
 
 show() { printf '\n$ kxacl %s\n' "$*"; "$kxacl" "$@" || printf '(exit status %d)\n' "$?"; }

@@ -246,8 +246,8 @@ int run_compile(const invocation &inv) {
     if (cached)
         out += "cached in " + inv.input + ".cacl\n";
     else if (inv.cache)
-        out += "not cached (the file changed within the last second, the cached file is newer, "
-               "or it could not be written)\n";
+        out += "not cached (a cached file newer than the text exists, or it could not be "
+               "written)\n";
     if (!inv.output.empty())
         out += "written to " + inv.output + "\n";
     print(out);
