@@ -25,7 +25,8 @@ using kxtest::hex_text;
 
 namespace {
 
-using arg = std::variant<long long, std::string>;
+using kxtest::arg;
+using kxtest::record_is;
 using items = std::vector<std::string>;
 constexpr kx_uint32_t untouched = 0xdeadbeef;
 
@@ -48,15 +49,6 @@ result groups_of(sec_acl_buffer_t acl, std::vector<const char *> names) {
     result r{0, untouched};
     r.status = sec__group_acles_perm(acl, list.count(), list.get(), &r.perm);
     return r;
-}
-
-// The thread's record holds message m with status and exactly these arguments.
-testing::AssertionResult record_is(kx_int32_t status, msg m, const std::vector<arg> &args) {
-    auto e = kxtest::last_error();
-    if (e.id == status && e.msg_num == m && e.args == args)
-        return testing::AssertionSuccess();
-    return testing::AssertionFailure()
-           << "record has status " << e.id << ", message " << e.msg_num << ": " << e.text;
 }
 
 // The same for the messages that end in a source position.
