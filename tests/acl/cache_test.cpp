@@ -20,6 +20,7 @@
 using namespace kxacl;
 using kxtest::dir_entries;
 using kxtest::last_error;
+using kxtest::record_is;
 using names = std::vector<std::string>;
 
 namespace {
@@ -34,12 +35,9 @@ struct cache_dir : kxtest::acl_dir {
     }
 };
 
-void expect_report(kx_int32_t rc, int msg_num, const std::string &arg0) {
+void expect_report(kx_int32_t rc, int msg_num, const std::vector<kxtest::arg> &args) {
     EXPECT_EQ(rc, SEC_S_FILE_ERROR);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_FILE_ERROR);
-    EXPECT_EQ(e.msg_num, msg_num);
-    EXPECT_EQ(e.str(0), arg0);
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, msg_num, args));
 }
 
 // "acl." and four lowercase hex digits.
@@ -106,16 +104,14 @@ TEST(CacheAclBuffer, PathOf4089CharactersIsTheLongestCached) {
     std::string too_long = dir + "/" + std::string(longest.size() - dir.size(), 'g');
     ASSERT_EQ(too_long.size(), 4090u);
     kxtest::write_file(too_long, "o r\n");
-    expect_report(sec__cache_aclbuffer(too_long.c_str(), &buffer, 0), MSG_2650_148, too_long);
+    expect_report(sec__cache_aclbuffer(too_long.c_str(), &buffer, 0), MSG_2650_148, {too_long});
     EXPECT_EQ(dir_entries(dir).size(), 3u) << "the 4089 pair and the 4090 file only";
 }
 
 TEST(CacheAclBuffer, MissingAclFileFailsWith135) {
     cache_dir d;
     ASSERT_EQ(unlink(d.acl.c_str()), 0);
-    kx_int32_t rc = d.cache();
-    expect_report(rc, MSG_2650_135, d.acl);
-    EXPECT_EQ(last_error().num(1), ENOENT);
+    expect_report(d.cache(), MSG_2650_135, {d.acl, ENOENT});
     EXPECT_TRUE(dir_entries(d.dir).empty());
 }
 
@@ -124,7 +120,7 @@ TEST(CacheAclBuffer, MissingAclFileFailsWith135) {
 // A file at the CACL name that is not the caller's to replace: refused,
 // and left as it was.
 void expect_kept(cache_dir &d, int msg_num, const std::string &contents, const names &files) {
-    expect_report(d.cache(1), msg_num, d.acl);
+    expect_report(d.cache(1), msg_num, {d.acl});
     EXPECT_EQ(kxtest::read_file(d.cacl), contents);
     EXPECT_EQ(dir_entries(d.dir), files);
 }
@@ -224,12 +220,7 @@ TEST(CacheAclBuffer, ShortWriteFailsWith152AndRemovesItsFiles) {
             file_size_limit full(limit);
             rc = d.cache();
         }
-        EXPECT_EQ(rc, SEC_S_FILE_ERROR);
-        auto e = last_error();
-        EXPECT_EQ(e.msg_num, MSG_2650_152);
-        EXPECT_EQ(e.num(0), limit ? 10 : -1);
-        EXPECT_EQ(e.num(1), 71);
-        EXPECT_EQ(e.num(2), limit ? 0 : EFBIG);
+        expect_report(rc, MSG_2650_152, {limit ? 10 : -1, 71, limit ? 0 : EFBIG});
         EXPECT_EQ(kxtest::read_file(d.cacl), limit ? "<missing>" : "old");
         EXPECT_EQ(dir_entries(d.dir), (limit ? names{"acl"} : names{"acl", "acl.cacl"}));
     }

@@ -31,6 +31,7 @@ using kxtest::example_acl;
 using kxtest::hex_of;
 using kxtest::hex_text;
 using kxtest::last_error;
+using kxtest::record_is;
 using names = std::vector<std::string>;
 using items = std::vector<std::string>;
 
@@ -83,20 +84,16 @@ TEST(ReadAclFile, BadArgumentsLeaveAclUntouchedAndHandBackTheFlags) {
     sec_buffer_s acl{7, reinterpret_cast<void *>(8)};
     kx_uint32_t rflags = unset;
     EXPECT_EQ(sec_read_acl_file(nullptr, nullptr, nullptr, 0x105, &acl, &rflags), SEC_S_BAD_PARAM);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_101);
-    EXPECT_EQ(e.str(0), "sec_read_acl_file");
-    EXPECT_EQ(e.num(1), 1);
-    EXPECT_EQ(e.num(2), 0);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 1, 0}));
     EXPECT_EQ(rflags, 0x105u);
     EXPECT_EQ(acl.length, 7);
 
     EXPECT_EQ(sec_read_acl_file("acl", nullptr, nullptr, 2, nullptr, &rflags), SEC_S_BAD_PARAM);
-    EXPECT_EQ(last_error().num(1), 5);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 5, 0}));
     EXPECT_EQ(rflags, 2u);
 
     EXPECT_EQ(sec_read_acl_file("acl", "", nullptr, 3, &acl, &rflags), SEC_S_BAD_PARAM);
-    EXPECT_EQ(last_error().msg_num, MSG_2650_134);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_134, {}));
     EXPECT_EQ(rflags, 3u);
     EXPECT_EQ(acl.length, 7);
 }
@@ -107,16 +104,10 @@ TEST(ReadAclFile, MissingOrNonRegularFileIsNoAclFile) {
     EXPECT_EQ(missing.status, SEC_S_NO_ACL_FILE);
     EXPECT_TRUE(missing.empty());
     EXPECT_EQ(missing.rflags, CACHE | CONVERT);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(e.msg_num, MSG_2650_135);
-    EXPECT_EQ(e.str(0), d.dir + "/none");
-    EXPECT_EQ(e.num(1), ENOENT);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_135, {d.dir + "/none", ENOENT}));
 
-    acl_read directory(d.dir, 0);
-    EXPECT_EQ(directory.status, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(last_error().id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(last_error().num(1), 0);
+    EXPECT_EQ(acl_read(d.dir, 0).status, SEC_S_NO_ACL_FILE);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_135, {d.dir, 0}));
 
     acl_read unresolved("acl", CACHE, "kx-no-such-user");
     EXPECT_EQ(unresolved.status, SEC_S_USER_NOT_FOUND);
@@ -139,7 +130,6 @@ TEST(ReadAclFile, EmptyFileIsTheEmptyAclWithoutLookingAtTheCaclFile) {
 // once compiling begins, 0x2 when nothing is cached), the record, and that
 // only a compiled ACL with entries is cached.
 TEST(ReadAclFile, CompilesTheTextIntoTheBuffer) {
-    using arg = std::variant<long long, std::string>;
     struct {
         const char *text;
         kx_uint32_t flags;
@@ -147,7 +137,7 @@ TEST(ReadAclFile, CompilesTheTextIntoTheBuffer) {
         std::string bytes;
         kx_uint32_t rflags;
         int msg_num;
-        std::vector<arg> args;
+        std::vector<kxtest::arg> args;
         names files;
     } cases[] = {
         // clang-format off
@@ -168,10 +158,7 @@ TEST(ReadAclFile, CompilesTheTextIntoTheBuffer) {
                   hex_of(c.bytes.data(), c.bytes.size()));
         EXPECT_EQ(r.bytes().empty(), r.empty());
         EXPECT_EQ(r.rflags, c.rflags);
-        auto e = last_error();
-        EXPECT_EQ(e.id, c.status);
-        EXPECT_EQ(e.msg_num, c.msg_num);
-        EXPECT_EQ(e.args, c.args);
+        EXPECT_TRUE(record_is(c.status, c.msg_num, c.args));
         EXPECT_EQ(dir_entries(d.dir), c.files);
     }
 }
@@ -187,9 +174,7 @@ TEST(ReadAclFile, PermissionsUseTheCallersTemplates) {
 
     acl_read refused(d.acl, 0);
     EXPECT_EQ(refused.status, SEC_S_BAD_PERMISSION);
-    EXPECT_EQ(last_error().msg_num, MSG_2650_180);
-    EXPECT_EQ(last_error().num(0), 1);
-    EXPECT_EQ(last_error().str(1), "ab");
+    EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_180, {1, "ab"}));
 }
 
 TEST(ReadAclFile, UnreadableTextFailsWith137) {
@@ -342,10 +327,7 @@ TEST(ReadAclFileUser, FileMustBeTheUsersAndWritableByNobodyElse) {
 
     acl_read not_owned("acl", CACHE, name);
     EXPECT_EQ(not_owned.status, SEC_S_BAD_PERMISSION);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_141);
-    EXPECT_EQ(e.str(0), acl);
-    EXPECT_EQ(e.str(1), t.user.name());
+    EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_141, {acl, t.user.name()}));
     EXPECT_EQ(not_owned.rflags, CACHE);
 
     ASSERT_EQ(chown(acl.c_str(), getpwnam(name)->pw_uid, static_cast<gid_t>(-1)), 0);
@@ -357,7 +339,7 @@ TEST(ReadAclFileUser, FileMustBeTheUsersAndWritableByNobodyElse) {
         ASSERT_EQ(chmod(acl.c_str(), mode), 0);
         acl_read writable("acl", 0, name);
         EXPECT_EQ(writable.status, SEC_S_BAD_PERMISSION) << std::oct << mode;
-        EXPECT_EQ(last_error().id, SEC_S_BAD_PERMISSION);
+        EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_141, {acl, t.user.name()}));
         EXPECT_TRUE(writable.empty());
     }
 }
