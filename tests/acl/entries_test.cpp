@@ -45,33 +45,28 @@ void expect_bad_param(const char *routine, int position, const void *value) {
     EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, kxacl::MSG_2650_101, {routine, position, shown}));
 }
 
+// Stored and displayed mechanism and identity; null for none.
 TEST(CreateAcle, StoresOnlyWhatTheTypeCarries) {
-    created n(SEC_ACLE_UNAUTHENTICATED, 5, "unix", "someone");
-    ASSERT_EQ(n.status, SEC_S_OK);
-    EXPECT_EQ(n.acle->type, SEC_ACLE_UNAUTHENTICATED);
-    EXPECT_EQ(n.acle->perm, 5u);
-    EXPECT_STREQ(n.acle->mech, "");
-    EXPECT_EQ(n.acle->id, nullptr);
-    displayed d(n.acle);
-    EXPECT_EQ(d.status, SEC_S_OK);
-    EXPECT_EQ(d.mech, nullptr);
-    EXPECT_EQ(d.id, nullptr);
-
-    created g(SEC_ACLE_GROUP, 1, "ignored", "staff");
-    ASSERT_EQ(g.status, SEC_S_OK);
-    EXPECT_STREQ(g.acle->mech, "");
-    EXPECT_STREQ(g.acle->id, "staff");
-    displayed dg(g.acle);
-    EXPECT_EQ(dg.status, SEC_S_OK);
-    EXPECT_EQ(dg.mech, nullptr);
-    EXPECT_STREQ(dg.id, "staff");
-
-    created u(SEC_ACLE_USER, 3, "0123456789abcdef", "joe");
-    ASSERT_EQ(u.status, SEC_S_OK);
-    EXPECT_STREQ(u.acle->mech, "0123456789abcdef");
-    displayed du(u.acle);
-    EXPECT_STREQ(du.mech, "0123456789abcdef");
-    EXPECT_STREQ(du.id, "joe");
+    const struct {
+        unsigned char type;
+        const char *mech, *id, *stored_mech, *stored_id, *shown_mech;
+    } cases[] = {
+        {SEC_ACLE_UNAUTHENTICATED, "unix", "someone", "", nullptr, nullptr},
+        {SEC_ACLE_GROUP, "ignored", "staff", "", "staff", nullptr},
+        {SEC_ACLE_USER, "0123456789abcdef", "joe", "0123456789abcdef", "joe", "0123456789abcdef"},
+    };
+    for (const auto &c : cases) {
+        created e(c.type, 5, c.mech, c.id);
+        ASSERT_EQ(e.status, SEC_S_OK);
+        EXPECT_EQ(e.acle->type, c.type);
+        EXPECT_EQ(e.acle->perm, 5u);
+        EXPECT_STREQ(e.acle->mech, c.stored_mech);
+        EXPECT_STREQ(e.acle->id, c.stored_id);
+        displayed d(e.acle);
+        ASSERT_EQ(d.status, SEC_S_OK);
+        EXPECT_STREQ(d.mech, c.shown_mech);
+        EXPECT_STREQ(d.id, c.stored_id);
+    }
 }
 
 TEST(CreateAcle, ArgumentsInParameterOrder) {
