@@ -118,6 +118,8 @@ TEST(SingleAclePerm, ArgumentFailuresInParameterOrder) {
     EXPECT_EQ(perm, untouched);
 }
 
+// Header faults are found before the other arguments are looked at, by
+// both evaluations, and even when no group is asked for.
 TEST(SingleAclePerm, HeaderFailuresComeBeforeTheType) {
     bytes good = example_acl();
     sec_buffer_s empty{0, nullptr};
@@ -129,11 +131,18 @@ TEST(SingleAclePerm, HeaderFailuresComeBeforeTheType) {
     foreign[2] = 1;
     owned_acl bad_type(wrong_type), bad_version(wrong_version), bad_order(foreign);
 
-    for (sec_buffer_s *acl :
-         {&empty, &no_value, short_acl.get(), bad_type.get(), bad_version.get()})
-        expect_refused(single(acl, 16, nullptr, nullptr, nullptr), SEC_S_BAD_ACL, MSG_2650_109);
-    expect_refused(single(bad_order.get(), 16, nullptr, nullptr, nullptr), SEC_S_BAD_ACL,
-                   MSG_2650_115);
+    for (auto [acl, m] : {std::pair{&empty, MSG_2650_109},
+                          {&no_value, MSG_2650_109},
+                          {short_acl.get(), MSG_2650_109},
+                          {bad_type.get(), MSG_2650_109},
+                          {bad_version.get(), MSG_2650_109},
+                          {bad_order.get(), MSG_2650_115}}) {
+        expect_refused(single(acl, 16, nullptr, nullptr, nullptr), SEC_S_BAD_ACL, m);
+        kx_uint32_t perm = untouched;
+        EXPECT_EQ(sec__group_acles_perm(acl, 0, nullptr, &perm), SEC_S_BAD_ACL);
+        EXPECT_TRUE(record_is(SEC_S_BAD_ACL, m, {}));
+        EXPECT_EQ(perm, untouched);
+    }
 }
 
 TEST(SingleAclePerm, TypeIsCheckedAndShownWholeByte) {
@@ -221,19 +230,6 @@ TEST(GroupAclesPerm, ArgumentFailuresInParameterOrder) {
     EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec__group_acles_perm", 3, 0}));
     EXPECT_EQ(sec__group_acles_perm(acl.get(), 0, nullptr, nullptr), SEC_S_BAD_PARAM);
     EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec__group_acles_perm", 4, 0}));
-    EXPECT_EQ(perm, untouched);
-}
-
-TEST(GroupAclesPerm, HeaderFailuresEvenWithoutGroups) {
-    sec_buffer_s empty{0, nullptr};
-    bytes foreign = example_acl();
-    foreign[2] = 1;
-    owned_acl bad_order(foreign);
-    kx_uint32_t perm = untouched;
-    EXPECT_EQ(sec__group_acles_perm(&empty, 0, nullptr, &perm), SEC_S_BAD_ACL);
-    EXPECT_TRUE(record_is(SEC_S_BAD_ACL, MSG_2650_109, {}));
-    EXPECT_EQ(sec__group_acles_perm(bad_order.get(), 0, nullptr, &perm), SEC_S_BAD_ACL);
-    EXPECT_TRUE(record_is(SEC_S_BAD_ACL, MSG_2650_115, {}));
     EXPECT_EQ(perm, untouched);
 }
 
