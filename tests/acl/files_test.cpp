@@ -154,15 +154,18 @@ struct read_result {
     }
 };
 
-// A file "acl" in a fresh directory with the given bytes, kept open.
 struct open_file {
-    std::string dir = kxtest::temp_dir();
-    std::string path = dir + "/acl";
     int fd;
-    explicit open_file(const std::string &bytes)
-        : fd((kxtest::write_file(path, bytes), open(path.c_str(), O_RDONLY | O_CLOEXEC))) {}
+    explicit open_file(const std::string &path) : fd(open(path.c_str(), O_RDONLY | O_CLOEXEC)) {}
     ~open_file() { close(fd); }
 };
+
+// The path of a file "acl" with the given bytes in a fresh directory.
+std::string acl_file_with(const std::string &bytes) {
+    std::string path = kxtest::temp_dir() + "/acl";
+    kxtest::write_file(path, bytes);
+    return path;
+}
 
 // A failed read: no buffer, and 2650-139 with what one read gave, the size
 // expected and errno.
@@ -174,14 +177,14 @@ void expect_short_read(const read_result &r, long long got, long long size, int 
 }
 
 TEST(ReadWholeAclFile, WholeFileFollowedByNul) {
-    open_file empty("");
-    read_result none(empty.path, empty.fd);
+    std::string empty = acl_file_with("");
+    read_result none(empty, open_file(empty).fd);
     EXPECT_EQ(none.status, SEC_S_OK);
     EXPECT_EQ(none.buffer, nullptr);
     EXPECT_EQ(none.size, 0u);
 
-    open_file f("o r\ng st r");
-    read_result r(f.path, f.fd);
+    std::string path = acl_file_with("o r\ng st r");
+    read_result r(path, open_file(path).fd);
     ASSERT_EQ(r.status, SEC_S_OK);
     ASSERT_EQ(r.size, 10u);
     ASSERT_NE(r.buffer, nullptr);
@@ -189,11 +192,12 @@ TEST(ReadWholeAclFile, WholeFileFollowedByNul) {
 }
 
 TEST(ReadWholeAclFile, FileReplacedAfterOpeningIsAShortRead) {
-    open_file f("o r\n");
+    std::string path = acl_file_with("o r\n");
+    open_file f(path);
     // The name now belongs to a longer file; the descriptor to the old one.
-    kxtest::write_file(f.dir + "/new", "o rw\ng staff r\n");
-    ASSERT_EQ(rename((f.dir + "/new").c_str(), f.path.c_str()), 0);
-    expect_short_read(read_result(f.path, f.fd), 0, 15, 0);
+    kxtest::write_file(path + ".new", "o rw\ng staff r\n");
+    ASSERT_EQ(rename((path + ".new").c_str(), path.c_str()), 0);
+    expect_short_read(read_result(path, f.fd), 0, 15, 0);
 }
 
 TEST(ReadWholeAclFile, ReadErrorShowsMinusOneAndErrno) {
@@ -201,24 +205,25 @@ TEST(ReadWholeAclFile, ReadErrorShowsMinusOneAndErrno) {
     struct stat st = kxtest::status_of(dir);
     if (st.st_size == 0)
         GTEST_SKIP() << "SKIPPED: directories have size 0 on this file system";
-    int fd = open(dir.c_str(), O_RDONLY | O_CLOEXEC);
-    expect_short_read(read_result(dir, fd), -1, st.st_size, EISDIR);
-    close(fd);
+    expect_short_read(read_result(dir, open_file(dir).fd), -1, st.st_size, EISDIR);
 }
 
 TEST(ReadWholeAclFile, NameWithoutFileFailsWith135) {
-    open_file f("o r\n");
-    ASSERT_EQ(unlink(f.path.c_str()), 0);
-    read_result r(f.path, f.fd);
+    std::string path = acl_file_with("o r\n");
+    open_file f(path);
+    ASSERT_EQ(unlink(path.c_str()), 0);
+    read_result r(path, f.fd);
     EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
     EXPECT_EQ(r.buffer, nullptr);
-    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_135, {f.path, ENOENT}));
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_135, {path, ENOENT}));
 }
 
 TEST(ReadWholeAclFile, NoMemoryForTheContents) {
-    open_file f("0123456789");
+    std::string path = kxtest::temp_dir() + "/acl";
+    kxtest::write_file(path, "0123456789");
+    open_file f(path);
     mem_fail_after(0);
-    read_result r(f.path, f.fd);
+    read_result r(path, f.fd);
     mem_fail_after(-1);
     EXPECT_EQ(r.status, SEC_S_NO_MEMORY);
     EXPECT_EQ(r.buffer, nullptr);
@@ -234,15 +239,16 @@ TEST(ReadWholeAclFile, NoMemoryForTheContents) {
 TEST(ReadWholeAclFile, ShortCountIsNotRetried) {
     std::string file = kxtest::start_tracing("_SEL:Info=1,Perf=2");
     ensure_trace_registered(); // no exported call here does it
-    open_file f("0123456789");
+    std::string path = acl_file_with("0123456789");
+    open_file f(path);
     ASSERT_EQ(lseek(f.fd, 4, SEEK_SET), 4);
-    expect_short_read(read_result(f.path, f.fd), 6, 10, 0);
+    expect_short_read(read_result(path, f.fd), 6, 10, 0);
     // The Info point shows the name, the size and the read's result.
     auto r = kxtest::read_trace(file);
     EXPECT_EQ(kxtest::trace_ids(file), (std::vector<unsigned>{0, 127, 6})); // 0: Perf 2 announced
     ASSERT_EQ(r.size(), 3u);
     EXPECT_EQ(r[1].items,
-              (std::vector<std::string>{kxtest::hex_text(f.path), kxtest::hex_of(std::uint64_t{10}),
+              (std::vector<std::string>{kxtest::hex_text(path), kxtest::hex_of(std::uint64_t{10}),
                                         kxtest::hex_of(std::int64_t{6})}));
     EXPECT_EQ(r[2].items.size(), 3u);
 }
