@@ -16,6 +16,8 @@
 
 #include <gtest/gtest.h>
 
+#include "acl_fixtures.h"
+
 namespace kxtest {
 
 inline void write_file(const std::string &path, const std::string &bytes, mode_t mode = 0644) {
@@ -99,21 +101,24 @@ inline std::string path_of_length(const std::string &base, std::size_t length) {
     return p + "/" + std::string(length - p.size() - 1, 'f');
 }
 
-// The ACL compiled from "u unix bob rw", "g staff r", "o r" (in that order):
-// the sub-ACLs stand in the reverse order of their first lines.
+// The ACL compiled from example_text, the worked example: the sub-ACLs
+// stand in the reverse order of their first lines.
 inline std::string example_acl() {
-    static const unsigned char bytes[] = {
-        0x85, 0x01, 0x02, 0x03, 0x00,                               // header, 3 sub-ACLs
-        0x11, 0x00, 0x00, 0x00, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00, // anyother
-        0x01, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00,                   //   o r
-        0x17, 0x00, 0x00, 0x00, 0x10, 0x01, 0x00, 0x00, 0x00, 0x00, // group
-        0x01, 0x01, 0x00, 0x00, 0x00, 0x06, 0x00, 's',  't',  'a',  'f',  'f',
-        0x00, 0x1a, 0x00, 0x00, 0x00, 0x04, 0x01, 0x00, 0x00, 0x00, 0x05, // user "unix"
-        'u',  'n',  'i',  'x',  0x00,                                     //
-        0x01, 0x03, 0x00, 0x00, 0x00, 0x04, 0x00, 'b',  'o',  'b',  0x00};
-    return std::string(reinterpret_cast<const char *>(bytes), sizeof bytes);
+    return std::string(worked_example.begin(), worked_example.end());
 }
 inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
+
+// An ACL file "acl" in a fresh directory, last changed 10 seconds ago so
+// that a CACL file written now is strictly newer.
+struct acl_dir {
+    std::string dir = temp_dir();
+    std::string acl = dir + "/acl";
+    std::string cacl = acl + ".cacl";
+    explicit acl_dir(const std::string &text = example_text, mode_t mode = 0644) {
+        write_file(acl, text, mode);
+        shift_mtime(acl, -10);
+    }
+};
 
 // A user made for one test with useradd, removed again with userdel.
 class scoped_user {
