@@ -1,5 +1,9 @@
-/* Creates ACL entries and translates permissions with the ACL library,
- * printing what it gets back. Uses the public interface only. */
+/* How a daemon authorizes requests with the ACL library: read the ACL of a
+ * resource from its ACL file (through the cached compiled file when that is
+ * current), then ask what it grants to each requester. Public interface only.
+ *
+ *   kxacl_example [ACL-FILE]      (default: resource.acl beside the program's sources)
+ */
 #include <stdio.h>
 #include <stdlib.h>
 
@@ -12,45 +16,61 @@ static void print_failure(const char *what, kx_int32_t status) {
     char *msg = NULL;
     cu_get_error_1(&err);
     cu_get_errmsg_1(err, &msg);
-    printf("%s failed with status %d:\n%s", what, (int)status, msg);
+    fprintf(stderr, "%s failed with status %d:\n%s", what, (int)status, msg ? msg : "");
     cu_rel_errmsg_1(msg);
     cu_rel_error_1(err);
 }
 
-static void show_entry(unsigned char type, kx_uint32_t perm, const char *mech, const char *id) {
-    sec_acle_t acle = NULL;
-    char *shown_mech = NULL, *shown_id = NULL, perms[33];
-    kx_int32_t rc = sec_create_acle(type, perm, mech, id, &acle);
-    if (rc != SEC_S_OK) {
-        print_failure("sec_create_acle", rc);
+/* Prints what the ACL grants to a user; a missing entry is status 43. */
+static void authorize_user(sec_buffer_t acl, const char *mech, const char *id) {
+    kx_uint32_t mask = 0;
+    char perms[33] = "";
+    kx_int32_t rc = sec__single_acle_perm(acl, SEC_ACLE_USER, (char *)mech, NULL, (char *)id,
+                                          &mask);
+    if (rc == SEC_S_BAD_ACLE) {
+        printf("%-40s no entry\n", id);
         return;
     }
-    rc = sec_display_acle_id(acle, &shown_mech, &shown_id);
     if (rc == SEC_S_OK)
-        rc = sec_translate_bitmask(acle->perm, NULL, perms);
-    if (rc == SEC_S_OK)
-        printf("entry type %u  mech %-6s  id %-24s  permissions %s\n", (unsigned)acle->type,
-               shown_mech ? shown_mech : "-", shown_id ? shown_id : "-", perms);
-    else
-        print_failure("displaying the entry", rc);
-    free(shown_mech);
-    free(shown_id);
-    sec_release_acle(acle);
+        rc = sec_translate_bitmask(mask, NULL, perms);
+    if (rc != SEC_S_OK) {
+        print_failure("authorizing a user", rc);
+        return;
+    }
+    printf("%-40s %-14s (0x%08x)\n", id, perms, (unsigned)mask);
 }
 
-int main(void) {
+/* Prints what the ACL grants to a requester that belongs to these groups. */
+static void authorize_groups(sec_buffer_t acl, const char *first, const char *second) {
+    sec_buffer_desc groups[2] = {{0, (void *)first}, {0, (void *)second}};
     kx_uint32_t mask = 0;
-    kx_int32_t rc = sec_translate_perms("rwx", NULL, &mask);
-    printf("permissions \"rwx\" are the mask 0x%08x (status %d)\n", (unsigned)mask, (int)rc);
+    char perms[33] = "";
+    kx_int32_t rc = sec__group_acles_perm(acl, 2, groups, &mask);
+    if (rc == SEC_S_OK)
+        rc = sec_translate_bitmask(mask, NULL, perms);
+    if (rc == SEC_S_OK)
+        printf("groups %s, %-24s %-14s (0x%08x)\n", first, second, perms, (unsigned)mask);
+    else
+        print_failure("authorizing groups", rc);
+}
 
-    show_entry(SEC_ACLE_ANYOTHER, 0x1, NULL, NULL);
-    show_entry(SEC_ACLE_USER, 0x3, "unix", "bob@host.example.com");
-    show_entry(SEC_ACLE_EXPANDED, 0x2, "unix", "0:0:0:0:0:0:0:1");
-    show_entry(SEC_ACLE_GROUP, 0x1f, NULL, "staff");
+int main(int argc, char **argv) {
+    const char *file = argc > 1 ? argv[1] : KXACL_EXAMPLE_ACL;
+    sec_buffer_desc acl = {0, NULL};
+    kx_uint32_t rflags = 0;
+    kx_int32_t rc = sec_read_acl_file(file, NULL, NULL, SEC_F_ACL_CONVERT, &acl, &rflags);
+    if (rc != SEC_S_OK) {
+        print_failure("sec_read_acl_file", rc);
+        return 1;
+    }
+    printf("%s: %d bytes, %s\n", file, (int)acl.length,
+           (rflags & SEC_F_ACL_TEXT) ? "compiled from the text" : "from the cached file");
 
-    /* A failure: 'z' is not a permission of the default templates. */
-    rc = sec_translate_perms("rwz", NULL, &mask);
-    if (rc != SEC_S_OK)
-        print_failure("sec_translate_perms(\"rwz\")", rc);
+    authorize_user(&acl, "unix", "root@node2.cluster.example");
+    authorize_user(&acl, "UNIX", "OpsBot@node1.cluster.example");
+    authorize_user(&acl, "unix", "mallory@node9.cluster.example");
+    authorize_groups(&acl, "auditors", "clusterops");
+
+    sec_release_acl(&acl);
     return 0;
 }

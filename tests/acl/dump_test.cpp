@@ -1,6 +1,6 @@
+// Dumping ACL buffers, sub-ACLs and entries to standard error, and the
+// failures that a dump prints on standard output.
 #include <cstdio>
-#include <cstring>
-#include <memory>
 #include <string>
 #include <unistd.h>
 #include <vector>
@@ -9,44 +9,15 @@
 
 #include <kx_acl.h>
 
-#include "alloc.h"
+#include "acl_fixtures.h"
 #include "buffer_format.h"
-#include "byteorder.h"
-#include "convert.h"
 #include "dump.h"
-#include "entries.h"
-#include "support.h"
-#include "tree.h"
 
 using namespace kxacl;
+using kxtest::build_acl;
+using kxtest::owned_acl;
 
 namespace {
-
-struct entry_values {
-    unsigned char type;
-    kx_uint32_t perm;
-    const char *mech;
-    const char *id;
-};
-
-// The bytes of an ACL buffer written from entries by the library's writers.
-std::vector<unsigned char> acl_of(std::initializer_list<entry_values> entries) {
-    sec_acltree_t *trees = nullptr;
-    int count = 0;
-    for (const entry_values &e : entries) {
-        sec_acle_t acle = nullptr;
-        EXPECT_EQ(sec__create_acle(e.type, e.perm, e.mech, e.id, 0, &acle), SEC_S_OK);
-        unique_acle owned(acle);
-        EXPECT_EQ(sec__add_acle_to_trees(acle, &trees, &count), SEC_S_OK);
-    }
-    sec_buffer_desc acl{};
-    EXPECT_EQ(sec__acltrees_to_acl(trees, count, &acl), SEC_S_OK);
-    free_acltrees(trees, count);
-    const auto *p = static_cast<const unsigned char *>(acl.value);
-    std::vector<unsigned char> bytes(p, p + acl.length);
-    std::free(acl.value);
-    return bytes;
-}
 
 // Standard error and standard output of a call.
 struct output {
@@ -84,10 +55,8 @@ template <typename F> output capture(F f) {
 // Dumps bytes from a heap block of exactly their size, so that a read past
 // the end is caught by the address sanitizer.
 output dump_bytes(const std::vector<unsigned char> &bytes) {
-    std::unique_ptr<unsigned char[]> exact(new unsigned char[bytes.size()]);
-    std::memcpy(exact.get(), bytes.data(), bytes.size());
-    sec_buffer_desc acl{static_cast<kx_int32_t>(bytes.size()), exact.get()};
-    return capture([&] { sec__dump_acl(&acl); });
+    owned_acl acl(bytes);
+    return capture([&] { sec__dump_acl(acl.get()); });
 }
 
 std::string descriptor_lines(int length, int count) {
@@ -105,7 +74,7 @@ std::string subacl_lines(const std::string &lead, int length, int type, const st
 
 // One user entry of "unix" for admin1 with read and write.
 std::vector<unsigned char> admin_acl() {
-    return acl_of({{SEC_ACLE_USER, 0x3, "unix", "admin1"}});
+    return build_acl({{SEC_ACLE_USER, 0x3, "unix", "admin1"}});
 }
 
 // The formatted text of the record that a failing call leaves.
@@ -131,13 +100,13 @@ TEST(DumpAcl, UserEntryPrintsDescriptorSubaclAndEntryLines) {
 }
 
 TEST(DumpAcl, EveryTypeInBufferOrder) {
-    std::vector<unsigned char> bytes = acl_of({{SEC_ACLE_UNAUTHENTICATED, 0x1, nullptr, nullptr},
-                                               {SEC_ACLE_ANYOTHER, 0x2, nullptr, nullptr},
-                                               {SEC_ACLE_USER, 0x8, "unix", "bob"},
-                                               {SEC_ACLE_USER, 0x1, "unix", "al"},
-                                               {SEC_ACLE_EXPANDED, 0x10, "krb5", "x@y"},
-                                               {SEC_ACLE_GROUP, 0x3, nullptr, "staff"},
-                                               {SEC_ACLE_GROUP, 0x0, nullptr, "admins"}});
+    std::vector<unsigned char> bytes = build_acl({{SEC_ACLE_UNAUTHENTICATED, 0x1},
+                                                  {SEC_ACLE_ANYOTHER, 0x2},
+                                                  {SEC_ACLE_USER, 0x8, "unix", "bob"},
+                                                  {SEC_ACLE_USER, 0x1, "unix", "al"},
+                                                  {SEC_ACLE_EXPANDED, 0x10, "krb5", "x@y"},
+                                                  {SEC_ACLE_GROUP, 0x3, "", "staff"},
+                                                  {SEC_ACLE_GROUP, 0x0, "", "admins"}});
     ASSERT_EQ(bytes.size(), 138u);
     output o = dump_bytes(bytes);
     EXPECT_EQ(o.err, descriptor_lines(138, 5) + subacl_lines("\t", 37, 16, "", 2) +
@@ -153,6 +122,8 @@ TEST(DumpAcl, EveryTypeInBufferOrder) {
     EXPECT_EQ(o.out, "");
 }
 
+// No buffer prints nothing, the empty ACL only the descriptor, and a buffer
+// of another type that it is not valid.
 TEST(DumpAcl, NullOrEmptyDescriptorPrintsNothing) {
     unsigned char byte = 0x85;
     sec_buffer_desc empty{0, nullptr}, no_value{5, nullptr}, no_length{0, &byte},
@@ -163,22 +134,16 @@ TEST(DumpAcl, NullOrEmptyDescriptorPrintsNothing) {
         EXPECT_EQ(o.err, "");
         EXPECT_EQ(o.out, "");
     }
-}
-
-TEST(DumpAcl, EmptyAclPrintsOnlyTheDescriptor) {
-    sec_buffer_desc acl{};
-    ASSERT_EQ(sec_create_empty_acl(&acl), SEC_S_OK);
-    output o = capture([&] { sec__dump_acl(&acl); });
-    sec_release_acl(&acl);
-    EXPECT_EQ(o.err, descriptor_lines(5, 0));
-    EXPECT_EQ(o.out, "");
-}
-
-TEST(DumpAcl, OtherBufferTypeIsNotValid) {
-    for (std::vector<unsigned char> bytes :
-         {std::vector<unsigned char>{0x84, 1, 2, 0, 0}, std::vector<unsigned char>{0x84}}) {
-        output o = dump_bytes(bytes);
-        EXPECT_EQ(o.err, "The ACL provided is not valid!\n\n");
+    const std::string not_valid = "The ACL provided is not valid!\n\n";
+    const struct {
+        std::vector<unsigned char> bytes;
+        std::string err;
+    } cases[] = {{{0x85, 1, 2, 0, 0}, descriptor_lines(5, 0)},
+                 {{0x84, 1, 2, 0, 0}, not_valid},
+                 {{0x84}, not_valid}};
+    for (const auto &c : cases) {
+        output o = dump_bytes(c.bytes);
+        EXPECT_EQ(o.err, c.err);
         EXPECT_EQ(o.out, "");
     }
 }
@@ -190,7 +155,7 @@ TEST(DumpAcl, MaskBitWithoutTemplatePrintsTheFailureInPlace) {
     });
     ASSERT_NE(expected.find("0x00002000"), std::string::npos);
     std::vector<unsigned char> bytes =
-        acl_of({{SEC_ACLE_USER, 0x2003, "unix", "admin1"}, {SEC_ACLE_USER, 0x1, "unix", "zed"}});
+        build_acl({{SEC_ACLE_USER, 0x2003, "unix", "admin1"}, {SEC_ACLE_USER, 0x1, "unix", "zed"}});
     output o = dump_bytes(bytes);
     EXPECT_EQ(o.err, descriptor_lines(45, 1) + subacl_lines("\t", 40, 4, "unix", 2) + expected +
                          "\t\ttype = u; mech = unix; id = zed; permission = r\n");
@@ -247,7 +212,7 @@ TEST(DumpAcl, CountsThatRunPastTheBufferStopTheDump) {
 }
 
 TEST(DumpAcl, SubaclThatCannotBecomeATreePrintsItsFailureOnStandardOutput) {
-    std::vector<unsigned char> bytes = acl_of({{SEC_ACLE_ANYOTHER, 0x2, nullptr, nullptr}});
+    std::vector<unsigned char> bytes = build_acl({{SEC_ACLE_ANYOTHER, 0x2}});
     store_u32(bytes.data() + layout::header_size + layout::at_acle_count, 2);
     output o = dump_bytes(bytes);
     EXPECT_EQ(o.err, descriptor_lines(22, 1) + subacl_lines("\t", 17, 2, "", 2));

@@ -16,9 +16,7 @@
 
 #include <gtest/gtest.h>
 
-#include <kx_acl.h>
-
-#include "support.h"
+#include "acl_fixtures.h"
 
 namespace kxtest {
 
@@ -103,19 +101,10 @@ inline std::string path_of_length(const std::string &base, std::size_t length) {
     return p + "/" + std::string(length - p.size() - 1, 'f');
 }
 
-// The ACL compiled from "u unix bob rw", "g staff r", "o r" (in that order):
-// the sub-ACLs stand in the reverse order of their first lines.
+// The ACL compiled from example_text, the worked example: the sub-ACLs
+// stand in the reverse order of their first lines.
 inline std::string example_acl() {
-    static const unsigned char bytes[] = {
-        0x85, 0x01, 0x02, 0x03, 0x00,                               // header, 3 sub-ACLs
-        0x11, 0x00, 0x00, 0x00, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00, // anyother
-        0x01, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00,                   //   o r
-        0x17, 0x00, 0x00, 0x00, 0x10, 0x01, 0x00, 0x00, 0x00, 0x00, // group
-        0x01, 0x01, 0x00, 0x00, 0x00, 0x06, 0x00, 's',  't',  'a',  'f',  'f',
-        0x00, 0x1a, 0x00, 0x00, 0x00, 0x04, 0x01, 0x00, 0x00, 0x00, 0x05, // user "unix"
-        'u',  'n',  'i',  'x',  0x00,                                     //
-        0x01, 0x03, 0x00, 0x00, 0x00, 0x04, 0x00, 'b',  'o',  'b',  0x00};
-    return std::string(reinterpret_cast<const char *>(bytes), sizeof bytes);
+    return std::string(worked_example.begin(), worked_example.end());
 }
 inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
 

@@ -18,6 +18,7 @@
 
 using namespace kxacl;
 using kxtest::last_error;
+using kxtest::record_is;
 
 namespace {
 
@@ -56,13 +57,8 @@ TEST(GetAclfname, FullPathIsTakenUnchangedUpToTheBufferSize) {
     ASSERT_EQ(fits.status, SEC_S_OK);
     EXPECT_EQ(std::string(fits.path), longest);
 
-    resolved too_long(longest + "b", nullptr);
-    EXPECT_EQ(too_long.status, SEC_S_NO_ACL_FILE);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(e.msg_num, MSG_2650_135);
-    EXPECT_EQ(e.str(0), longest + "b");
-    EXPECT_EQ(e.num(1), ENAMETOOLONG);
+    EXPECT_EQ(resolved(longest + "b", nullptr).status, SEC_S_NO_ACL_FILE);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_135, {longest + "b", ENAMETOOLONG}));
 }
 
 TEST(GetAclfname, WorkingDirectoryPlusNameMustFit) {
@@ -76,22 +72,8 @@ TEST(GetAclfname, WorkingDirectoryPlusNameMustFit) {
     ASSERT_EQ(fits.status, SEC_S_OK);
     EXPECT_EQ(std::strlen(fits.path), 4096u);
 
-    resolved too_long(name + "n", nullptr);
-    EXPECT_EQ(too_long.status, SEC_S_NO_ACL_FILE);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(e.msg_num, MSG_2650_167);
-    EXPECT_EQ(e.str(0), deep);
-    EXPECT_EQ(e.str(1), name + "n");
-}
-
-TEST(GetAclfname, PathInTheUsersHome) {
-    std::string root_home = home_of("root");
-    ASSERT_FALSE(root_home.empty());
-    resolved r("acl", "root");
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(std::string(r.path), root_home + "/acl");
-    EXPECT_EQ(r.uid, 0u);
+    EXPECT_EQ(resolved(name + "n", nullptr).status, SEC_S_NO_ACL_FILE);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_167, {deep, name + "n"}));
 }
 
 TEST(GetAclfname, HomeDirectoriesWithAndWithoutTrailingSlash) {
@@ -109,43 +91,33 @@ TEST(GetAclfname, HomeDirectoriesWithAndWithoutTrailingSlash) {
     EXPECT_STREQ(r2.path, "/home/kxjoe/acl");
 }
 
+// The user's home joins the name; lengths adding up to 4095 resolve (with
+// the "/" 4096), 4096 do not.
 TEST(GetAclfname, HomePlusNameMustFit) {
     std::string home = home_of("root");
     ASSERT_FALSE(home.empty());
-    // Lengths adding up to 4095 resolve (with the "/" 4096); 4096 do not.
     std::string name(4095 - home.size(), 'n');
     resolved fits(name, "root");
     ASSERT_EQ(fits.status, SEC_S_OK);
-    EXPECT_EQ(std::strlen(fits.path), 4096u);
+    EXPECT_EQ(std::string(fits.path), home + "/" + name);
+    EXPECT_EQ(fits.uid, 0u);
 
-    resolved too_long(name + "n", "root");
-    EXPECT_EQ(too_long.status, SEC_S_BAD_PARAM);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_165);
-    EXPECT_EQ(e.str(0), name + "n");
-    EXPECT_EQ(e.str(1), "root");
+    EXPECT_EQ(resolved(name + "n", "root").status, SEC_S_BAD_PARAM);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_165, {name + "n", "root"}));
 }
 
 TEST(GetAclfname, NameWithPathRefusedBeforeTheUserIsLookedUp) {
     // The user does not exist: 2650-165 (status 4) proves no lookup happened.
     for (const char *name : {"dir/acl", "/tmp/acl", "acl/"}) {
-        resolved r(name, "kx-no-such-user");
-        EXPECT_EQ(r.status, SEC_S_BAD_PARAM) << name;
-        auto e = last_error();
-        EXPECT_EQ(e.msg_num, MSG_2650_165);
-        EXPECT_EQ(e.str(0), name);
-        EXPECT_EQ(e.str(1), "kx-no-such-user");
+        EXPECT_EQ(resolved(name, "kx-no-such-user").status, SEC_S_BAD_PARAM) << name;
+        EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_165, {name, "kx-no-such-user"}));
     }
 }
 
 TEST(GetAclfname, UnknownAndEmptyUsersAreNotFound) {
     for (const char *user : {"kx-no-such-user", ""}) {
-        resolved r("acl", user);
-        EXPECT_EQ(r.status, SEC_S_USER_NOT_FOUND) << user;
-        auto e = last_error();
-        EXPECT_EQ(e.id, SEC_S_USER_NOT_FOUND);
-        EXPECT_EQ(e.msg_num, MSG_2650_140);
-        EXPECT_EQ(e.str(0), user);
+        EXPECT_EQ(resolved("acl", user).status, SEC_S_USER_NOT_FOUND) << user;
+        EXPECT_TRUE(record_is(SEC_S_USER_NOT_FOUND, MSG_2650_140, {user}));
     }
 }
 
@@ -188,21 +160,31 @@ struct open_file {
     ~open_file() { close(fd); }
 };
 
-TEST(ReadWholeAclFile, EmptyFileGivesNoBuffer) {
+// The path of a file "acl" with the given bytes in a fresh directory.
+std::string acl_file_with(const std::string &bytes) {
     std::string path = kxtest::temp_dir() + "/acl";
-    kxtest::write_file(path, "");
-    open_file f(path);
-    read_result r(path, f.fd);
-    EXPECT_EQ(r.status, SEC_S_OK);
+    kxtest::write_file(path, bytes);
+    return path;
+}
+
+// A failed read: no buffer, and 2650-139 with what one read gave, the size
+// expected and errno.
+void expect_short_read(const read_result &r, long long got, long long size, int err) {
+    EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
     EXPECT_EQ(r.buffer, nullptr);
     EXPECT_EQ(r.size, 0u);
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_139, {got, size, err}));
 }
 
 TEST(ReadWholeAclFile, WholeFileFollowedByNul) {
-    std::string path = kxtest::temp_dir() + "/acl";
-    kxtest::write_file(path, "o r\ng st r");
-    open_file f(path);
-    read_result r(path, f.fd);
+    std::string empty = acl_file_with("");
+    read_result none(empty, open_file(empty).fd);
+    EXPECT_EQ(none.status, SEC_S_OK);
+    EXPECT_EQ(none.buffer, nullptr);
+    EXPECT_EQ(none.size, 0u);
+
+    std::string path = acl_file_with("o r\ng st r");
+    read_result r(path, open_file(path).fd);
     ASSERT_EQ(r.status, SEC_S_OK);
     ASSERT_EQ(r.size, 10u);
     ASSERT_NE(r.buffer, nullptr);
@@ -210,69 +192,30 @@ TEST(ReadWholeAclFile, WholeFileFollowedByNul) {
 }
 
 TEST(ReadWholeAclFile, FileReplacedAfterOpeningIsAShortRead) {
-    std::string dir = kxtest::temp_dir();
-    std::string path = dir + "/acl";
-    kxtest::write_file(path, "o r\n");
+    std::string path = acl_file_with("o r\n");
     open_file f(path);
     // The name now belongs to a longer file; the descriptor to the old one.
-    kxtest::write_file(dir + "/new", "o rw\ng staff r\n");
-    ASSERT_EQ(rename((dir + "/new").c_str(), path.c_str()), 0);
-    read_result r(path, f.fd);
-    EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
-    EXPECT_EQ(r.buffer, nullptr);
-    EXPECT_EQ(r.size, 0u);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_139);
-    EXPECT_EQ(e.num(0), 0);
-    EXPECT_EQ(e.num(1), 15);
-    EXPECT_EQ(e.num(2), 0);
-}
-
-TEST(ReadWholeAclFile, ShortCountIsNotRetried) {
-    std::string path = kxtest::temp_dir() + "/acl";
-    kxtest::write_file(path, "0123456789");
-    open_file f(path);
-    // Four bytes already consumed: one read returns the remaining six.
-    ASSERT_EQ(lseek(f.fd, 4, SEEK_SET), 4);
-    read_result r(path, f.fd);
-    EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
-    EXPECT_EQ(r.buffer, nullptr);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_139);
-    EXPECT_EQ(e.num(0), 6);
-    EXPECT_EQ(e.num(1), 10);
-    EXPECT_EQ(e.num(2), 0);
+    kxtest::write_file(path + ".new", "o rw\ng staff r\n");
+    ASSERT_EQ(rename((path + ".new").c_str(), path.c_str()), 0);
+    expect_short_read(read_result(path, f.fd), 0, 15, 0);
 }
 
 TEST(ReadWholeAclFile, ReadErrorShowsMinusOneAndErrno) {
     std::string dir = kxtest::temp_dir();
-    open_file f(dir);
     struct stat st = kxtest::status_of(dir);
     if (st.st_size == 0)
         GTEST_SKIP() << "SKIPPED: directories have size 0 on this file system";
-    read_result r(dir, f.fd);
-    EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
-    EXPECT_EQ(r.buffer, nullptr);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_139);
-    EXPECT_EQ(e.num(0), -1);
-    EXPECT_EQ(e.num(1), st.st_size);
-    EXPECT_EQ(e.num(2), EISDIR);
+    expect_short_read(read_result(dir, open_file(dir).fd), -1, st.st_size, EISDIR);
 }
 
 TEST(ReadWholeAclFile, NameWithoutFileFailsWith135) {
-    std::string path = kxtest::temp_dir() + "/acl";
-    kxtest::write_file(path, "o r\n");
+    std::string path = acl_file_with("o r\n");
     open_file f(path);
     ASSERT_EQ(unlink(path.c_str()), 0);
     read_result r(path, f.fd);
     EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
     EXPECT_EQ(r.buffer, nullptr);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_FILE_ERROR);
-    EXPECT_EQ(e.msg_num, MSG_2650_135);
-    EXPECT_EQ(e.str(0), path);
-    EXPECT_EQ(e.num(1), ENOENT);
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_135, {path, ENOENT}));
 }
 
 TEST(ReadWholeAclFile, NoMemoryForTheContents) {
@@ -291,29 +234,23 @@ TEST(ReadWholeAclFile, NoMemoryForTheContents) {
     EXPECT_EQ(e.num(1), 11);
 }
 
-TEST(ReadWholeAclFile, InfoAndPerfPoints) {
+// A read that returns fewer bytes than the size is not retried: four
+// bytes consumed, one read returns the remaining six.
+TEST(ReadWholeAclFile, ShortCountIsNotRetried) {
     std::string file = kxtest::start_tracing("_SEL:Info=1,Perf=2");
     ensure_trace_registered(); // no exported call here does it
-    std::string path = kxtest::temp_dir() + "/acl";
-    kxtest::write_file(path, "0123456789");
+    std::string path = acl_file_with("0123456789");
     open_file f(path);
     ASSERT_EQ(lseek(f.fd, 4, SEEK_SET), 4);
-    read_result r(path, f.fd);
-    ASSERT_EQ(r.status, SEC_S_FILE_ERROR);
-    std::vector<unsigned> ids;
-    for (const auto &rec : kxtest::read_trace(file)) {
-        ids.push_back(rec.id);
-        if (rec.id == 127) {
-            ASSERT_EQ(rec.items.size(), 3u);
-            EXPECT_EQ(rec.items[0], kxtest::hex_text(path));
-            EXPECT_EQ(rec.items[1], kxtest::hex_of(std::uint64_t{10}));
-            EXPECT_EQ(rec.items[2], kxtest::hex_of(std::int64_t{6}));
-        }
-        if (rec.id == 6) {
-            EXPECT_EQ(rec.items.size(), 3u);
-        }
-    }
-    EXPECT_EQ(ids, (std::vector<unsigned>{0, 127, 6})); // 0: registration at Perf 2
+    expect_short_read(read_result(path, f.fd), 6, 10, 0);
+    // The Info point shows the name, the size and the read's result.
+    auto r = kxtest::read_trace(file);
+    EXPECT_EQ(kxtest::trace_ids(file), (std::vector<unsigned>{0, 127, 6})); // 0: Perf 2 announced
+    ASSERT_EQ(r.size(), 3u);
+    EXPECT_EQ(r[1].items,
+              (std::vector<std::string>{kxtest::hex_text(path), kxtest::hex_of(std::uint64_t{10}),
+                                        kxtest::hex_of(std::int64_t{6})}));
+    EXPECT_EQ(r[2].items.size(), 3u);
 }
 
 } // namespace

@@ -6,15 +6,18 @@
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
+#include <functional>
 #include <mutex>
 #include <pwd.h>
 #include <string>
 #include <thread>
+#include <variant>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include <kx_acl.h>
+#include <kx_tr.h>
 
 #include "alloc.h"
 #include "file_helpers.h"
@@ -27,10 +30,15 @@ using kxtest::acl_read;
 using kxtest::CACHE;
 using kxtest::CONVERT;
 using kxtest::dir_entries;
+using kxtest::example_acl;
+using kxtest::hex_of;
+using kxtest::hex_text;
 using kxtest::last_error;
 using kxtest::TEXT;
 using kxtest::unset;
+using kxtest::record_is;
 using names = std::vector<std::string>;
+using items = std::vector<std::string>;
 
 namespace {
 
@@ -46,26 +54,28 @@ void expect_no_error() {
     EXPECT_EQ(last_error().id, 0) << last_error().text;
 }
 
+// A user made for one test, with home as its home directory.
+struct test_user {
+    std::string home = kxtest::temp_dir();
+    kxtest::scoped_user user{home};
+};
+
 // ---- arguments and the ACL file ------------------------------------------
 
 TEST(ReadAclFile, BadArgumentsLeaveAclUntouchedAndHandBackTheFlags) {
     sec_buffer_s acl{7, reinterpret_cast<void *>(8)};
     kx_uint32_t rflags = unset;
     EXPECT_EQ(sec_read_acl_file(nullptr, nullptr, nullptr, 0x105, &acl, &rflags), SEC_S_BAD_PARAM);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_101);
-    EXPECT_EQ(e.str(0), "sec_read_acl_file");
-    EXPECT_EQ(e.num(1), 1);
-    EXPECT_EQ(e.num(2), 0);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 1, 0}));
     EXPECT_EQ(rflags, 0x105u);
     EXPECT_EQ(acl.length, 7);
 
     EXPECT_EQ(sec_read_acl_file("acl", nullptr, nullptr, 2, nullptr, &rflags), SEC_S_BAD_PARAM);
-    EXPECT_EQ(last_error().num(1), 5);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 5, 0}));
     EXPECT_EQ(rflags, 2u);
 
     EXPECT_EQ(sec_read_acl_file("acl", "", nullptr, 3, &acl, &rflags), SEC_S_BAD_PARAM);
-    EXPECT_EQ(last_error().msg_num, MSG_2650_134);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_134, {}));
     EXPECT_EQ(rflags, 3u);
     EXPECT_EQ(acl.length, 7);
 }
@@ -76,29 +86,21 @@ TEST(ReadAclFile, MissingOrNonRegularFileIsNoAclFile) {
     EXPECT_EQ(missing.status, SEC_S_NO_ACL_FILE);
     EXPECT_TRUE(missing.empty());
     EXPECT_EQ(missing.rflags, CACHE | CONVERT);
-    auto e = last_error();
-    EXPECT_EQ(e.id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(e.msg_num, MSG_2650_135);
-    EXPECT_EQ(e.str(0), d.dir + "/none");
-    EXPECT_EQ(e.num(1), ENOENT);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_135, {d.dir + "/none", ENOENT}));
 
-    acl_read directory(d.dir, 0);
-    EXPECT_EQ(directory.status, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(last_error().id, SEC_S_NO_ACL_FILE);
-    EXPECT_EQ(last_error().num(1), 0);
-}
+    EXPECT_EQ(acl_read(d.dir, 0).status, SEC_S_NO_ACL_FILE);
+    EXPECT_TRUE(record_is(SEC_S_NO_ACL_FILE, MSG_2650_135, {d.dir, 0}));
 
-TEST(ReadAclFile, UnresolvedNameFailsWithTheResolversStatus) {
-    acl_read r("acl", CACHE, "kx-no-such-user");
-    EXPECT_EQ(r.status, SEC_S_USER_NOT_FOUND);
-    EXPECT_TRUE(r.empty());
-    EXPECT_EQ(r.rflags, CACHE);
+    acl_read unresolved("acl", CACHE, "kx-no-such-user");
+    EXPECT_EQ(unresolved.status, SEC_S_USER_NOT_FOUND);
+    EXPECT_TRUE(unresolved.empty());
+    EXPECT_EQ(unresolved.rflags, CACHE);
 }
 
 TEST(ReadAclFile, EmptyFileIsTheEmptyAclWithoutLookingAtTheCaclFile) {
     std::string trace = kxtest::start_tracing("_SEL:Info=1");
     acl_dir d("");
-    kxtest::write_file(d.cacl, kxtest::example_acl());
+    kxtest::write_file(d.cacl, example_acl());
     acl_read r(d.acl, CACHE | 0x100);
     EXPECT_EQ(r.status, SEC_S_OK);
     EXPECT_TRUE(r.empty());
@@ -106,46 +108,41 @@ TEST(ReadAclFile, EmptyFileIsTheEmptyAclWithoutLookingAtTheCaclFile) {
     EXPECT_EQ(kxtest::trace_ids(trace), (std::vector<unsigned>{116}));
 }
 
+// Compiling texts: what comes back, the flags handed back (0x4 is cleared
+// once compiling begins, 0x2 when nothing is cached), the record, and that
+// only a compiled ACL with entries is cached.
 TEST(ReadAclFile, CompilesTheTextIntoTheBuffer) {
-    acl_dir d;
-    acl_read r(d.acl, CONVERT);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(kxtest::hex_of(r.bytes().data(), r.bytes().size()),
-              kxtest::hex_of(kxtest::example_acl().data(), 71));
-    EXPECT_EQ(r.rflags, TEXT) << "0x4 is cleared once compiling begins";
-    expect_no_error();
-}
-
-TEST(ReadAclFile, FileWithoutEntriesIsTheEmptyAclAndNotCached) {
-    acl_dir d("# nothing here\n\n   \t# at all\n");
-    acl_read r(d.acl, CACHE);
-    EXPECT_EQ(r.status, SEC_S_OK);
-    EXPECT_TRUE(r.empty());
-    EXPECT_EQ(r.rflags, TEXT);
-    expect_no_error();
-    EXPECT_EQ(dir_entries(d.dir), (names{"acl"}));
-}
-
-TEST(ReadAclFile, BadThirdLineReturnsNothingAndCachesNothing) {
-    acl_dir d("o r\ng staff rw\nx joe r\nn\n");
-    acl_read r(d.acl, CACHE | CONVERT | 0x100);
-    EXPECT_EQ(r.status, SEC_S_BAD_ACL);
-    EXPECT_TRUE(r.empty());
-    EXPECT_EQ(r.rflags, TEXT | CACHE | 0x100) << "0x2 unchanged, 0x4 cleared";
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_179);
-    EXPECT_EQ(e.num(0), 3);
-    EXPECT_EQ(e.str(1), "x");
-    EXPECT_EQ(dir_entries(d.dir), (names{"acl"}));
-}
-
-TEST(ReadAclFile, DuplicateEntriesFail) {
-    acl_dir d("g staff r\nu unix bob\ng STAFF w\n");
-    acl_read r(d.acl, CACHE);
-    EXPECT_EQ(r.status, SEC_S_BAD_ACLE);
-    EXPECT_TRUE(r.empty());
-    EXPECT_EQ(last_error().msg_num, MSG_2650_175);
-    EXPECT_EQ(dir_entries(d.dir), (names{"acl"}));
+    struct {
+        const char *text;
+        kx_uint32_t flags;
+        kx_int32_t status;
+        std::string bytes;
+        kx_uint32_t rflags;
+        int msg_num;
+        std::vector<kxtest::arg> args;
+        names files;
+    } cases[] = {
+        // clang-format off
+        {kxtest::example_text, CONVERT, SEC_S_OK, example_acl(), TEXT, 0, {}, {"acl"}},
+        {"# nothing here\n\n   \t# at all\n", CACHE, SEC_S_OK, "", TEXT, 0, {}, {"acl"}},
+        {"o r\ng staff rw\nx joe r\nn\n", CACHE | CONVERT | 0x100, SEC_S_BAD_ACL, "",
+         TEXT | CACHE | 0x100, MSG_2650_179, {3, "x"}, {"acl"}},
+        {"g staff r\nu unix bob\ng STAFF w\n", CACHE, SEC_S_BAD_ACLE, "", TEXT | CACHE,
+         MSG_2650_175, {'g', "STAFF"}, {"acl"}},
+        // clang-format on
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.text);
+        acl_dir d(c.text);
+        acl_read r(d.acl, c.flags);
+        EXPECT_EQ(r.status, c.status);
+        EXPECT_EQ(hex_of(r.bytes().data(), r.bytes().size()),
+                  hex_of(c.bytes.data(), c.bytes.size()));
+        EXPECT_EQ(r.bytes().empty(), r.empty());
+        EXPECT_EQ(r.rflags, c.rflags);
+        EXPECT_TRUE(record_is(c.status, c.msg_num, c.args));
+        EXPECT_EQ(dir_entries(d.dir), c.files);
+    }
 }
 
 TEST(ReadAclFile, PermissionsUseTheCallersTemplates) {
@@ -155,11 +152,11 @@ TEST(ReadAclFile, PermissionsUseTheCallersTemplates) {
     acl_read r(d.acl, 0, nullptr, &set);
     ASSERT_EQ(r.status, SEC_S_OK);
     ASSERT_EQ(r.acl.length, 22);
-    EXPECT_EQ(kxtest::hex_of(static_cast<char *>(r.acl.value) + 16, 4), "30000000");
+    EXPECT_EQ(hex_of(static_cast<char *>(r.acl.value) + 16, 4), "30000000");
 
     acl_read refused(d.acl, 0);
     EXPECT_EQ(refused.status, SEC_S_BAD_PERMISSION);
-    EXPECT_EQ(last_error().msg_num, MSG_2650_180);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_180, {1, "ab"}));
 }
 
 TEST(ReadAclFile, UnreadableTextFailsWith137) {
@@ -211,185 +208,131 @@ TEST(ReadAclFileCache, TouchedAclFileIsCompiledAgain) {
     EXPECT_EQ(kxtest::read_file(d.cacl), second.bytes()) << "the stale CACL file is replaced";
 }
 
-TEST(ReadAclFileCache, SameSecondCaclFileIsNotUsed) {
-    acl_dir d;
-    kxtest::write_file(d.cacl, "garbage");
-    kxtest::set_mtime(d.acl, 1700000000);
-    kxtest::set_mtime(d.cacl, 1700000000);
-    acl_read r(d.acl, 0);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.rflags, TEXT);
-    EXPECT_EQ(r.bytes(), kxtest::example_acl());
-}
-
-TEST(ReadAclFileCache, TextFlagCompilesAnywayAndLeavesANewerCaclFile) {
-    acl_dir d;
-    kxtest::write_file(d.cacl, "garbage"); // newer, same owner and mode
-    acl_read r(d.acl, TEXT);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.bytes(), kxtest::example_acl());
-    EXPECT_EQ(r.rflags, TEXT);
-
-    acl_read cached(d.acl, TEXT | CACHE);
-    ASSERT_EQ(cached.status, SEC_S_OK);
-    EXPECT_EQ(cached.bytes(), kxtest::example_acl());
-    EXPECT_EQ(cached.rflags, TEXT) << "nothing written: the CACL file is newer";
-    EXPECT_EQ(kxtest::read_file(d.cacl), "garbage");
-    expect_no_error();
-}
-
-TEST(ReadAclFileCache, CaclFileOfAnotherModeIsNeitherUsedNorReplaced) {
-    acl_dir d;
-    kxtest::write_file(d.cacl, "garbage", 0600);
-    acl_read r(d.acl, CACHE);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.bytes(), kxtest::example_acl());
-    EXPECT_EQ(r.rflags, TEXT) << "the refused cache write clears 0x2";
-    expect_no_error();
-    EXPECT_EQ(kxtest::read_file(d.cacl), "garbage");
+// A file at the CACL name that is not to be trusted, or not without
+// checking: what the read gives, the flags it hands back, and the file
+// that stays at the CACL name.
+TEST(ReadAclFileCache, CaclFilesThatAreNotTrusted) {
+    const std::string swapped(kxtest::worked_example_swapped.begin(),
+                              kxtest::worked_example_swapped.end());
+    auto garbage = [](const acl_dir &d) { kxtest::write_file(d.cacl, "garbage"); };
+    struct {
+        const char *what;
+        std::function<void(const acl_dir &)> prepare;
+        kx_uint32_t flags;
+        std::string bytes;
+        kx_uint32_t rflags;
+        std::string cacl;
+    } cases[] = {
+        // clang-format off
+        {"changed in the same second", [&](const acl_dir &d) {
+             garbage(d);
+             kxtest::set_mtime(d.acl, 1700000000);
+             kxtest::set_mtime(d.cacl, 1700000000);
+         }, 0, example_acl(), TEXT, "garbage"},
+        {"newer, yet the text flag compiles", garbage, TEXT, example_acl(), TEXT, "garbage"},
+        {"newer, so nothing is cached", garbage, TEXT | CACHE, example_acl(), TEXT, "garbage"},
+        {"another mode: the refused write clears 0x2", [](const acl_dir &d) {
+             kxtest::write_file(d.cacl, "garbage", 0600);
+         }, CACHE, example_acl(), TEXT, "garbage"},
+        {"garbage, unchecked without 0x4", garbage, 0, "garbage", 0, "garbage"},
+        {"garbage, refused with 0x4", garbage, CONVERT, example_acl(), TEXT, "garbage"},
+        {"the other byte order, converted with 0x4", [&](const acl_dir &d) {
+             kxtest::write_file(d.cacl, swapped);
+         }, CONVERT, example_acl(), CONVERT, swapped},
+        {"a symbolic link, never followed", [](const acl_dir &d) {
+             kxtest::write_file(d.dir + "/target", "n r\n"); // newer, same owner and mode
+             ASSERT_EQ(symlink((d.dir + "/target").c_str(), d.cacl.c_str()), 0);
+         }, CACHE, example_acl(), TEXT, "n r\n"},
+        // clang-format on
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.what);
+        acl_dir d;
+        c.prepare(d);
+        acl_read r(d.acl, c.flags);
+        ASSERT_EQ(r.status, SEC_S_OK);
+        EXPECT_EQ(hex_of(r.bytes().data(), r.bytes().size()),
+                  hex_of(c.bytes.data(), c.bytes.size()));
+        EXPECT_EQ(r.rflags, c.rflags);
+        expect_no_error();
+        EXPECT_EQ(kxtest::read_file(d.cacl), c.cacl);
+    }
 }
 
 TEST(ReadAclFileCache, CaclFileOfAnotherOwnerIsNeitherUsedNorReplaced) {
     KXTEST_REQUIRE_ROOT();
-    acl_dir d;
-    kxtest::write_file(d.cacl, kxtest::example_acl());
+    acl_dir d("n r\n");
+    kxtest::write_file(d.cacl, example_acl());
     ASSERT_EQ(chown(d.cacl.c_str(), 65534, 65534), 0);
-    kxtest::write_file(d.acl, "n r\n");
-    kxtest::shift_mtime(d.acl, -10);
     acl_read r(d.acl, CACHE);
     ASSERT_EQ(r.status, SEC_S_OK);
     EXPECT_EQ(r.bytes(), compiled("n r\n"));
     EXPECT_EQ(r.rflags, TEXT);
     expect_no_error();
-    EXPECT_EQ(kxtest::read_file(d.cacl), kxtest::example_acl());
+    EXPECT_EQ(kxtest::read_file(d.cacl), example_acl());
     EXPECT_EQ(kxtest::status_of(d.cacl).st_uid, 65534u);
 }
 
-TEST(ReadAclFileCache, GarbageCaclFileIsReturnedOnlyWithoutConvert) {
-    acl_dir d;
-    kxtest::write_file(d.cacl, "garbage");
-    acl_read unchecked(d.acl, 0);
-    ASSERT_EQ(unchecked.status, SEC_S_OK);
-    EXPECT_EQ(unchecked.bytes(), "garbage");
-    EXPECT_EQ(unchecked.rflags, 0u);
-
-    acl_read checked(d.acl, CONVERT);
-    ASSERT_EQ(checked.status, SEC_S_OK);
-    EXPECT_EQ(checked.bytes(), kxtest::example_acl());
-    EXPECT_EQ(checked.rflags, TEXT);
-    expect_no_error();
-}
-
-TEST(ReadAclFileCache, ForeignOrderCaclFileIsConvertedWithConvert) {
-    acl_dir d;
-    // The example in big-endian order, with a mark other than 2.
-    std::string big = kxtest::example_acl();
-    big[2] = 1;
-    std::swap(big[3], big[4]);
-    for (std::size_t sub : {5u, 22u, 45u}) {
-        std::swap(big[sub], big[sub + 3]);
-        std::swap(big[sub + 1], big[sub + 2]);
-        std::swap(big[sub + 5], big[sub + 8]);
-        std::swap(big[sub + 6], big[sub + 7]);
-    }
-    for (std::size_t entry : {15u, 32u, 60u}) {
-        std::swap(big[entry + 1], big[entry + 4]);
-        std::swap(big[entry + 2], big[entry + 3]);
-        std::swap(big[entry + 5], big[entry + 6]);
-    }
-    kxtest::write_file(d.cacl, big);
-    acl_read r(d.acl, CONVERT);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.rflags, CONVERT);
-    EXPECT_EQ(kxtest::hex_of(r.bytes().data(), r.bytes().size()),
-              kxtest::hex_of(kxtest::example_acl().data(), 71));
-}
-
-TEST(ReadAclFileCache, SymbolicLinkAtTheCaclNameIsNeverFollowed) {
-    acl_dir d;
-    std::string target = d.dir + "/target";
-    kxtest::write_file(target, "n r\n"); // newer, same owner and mode
-    ASSERT_EQ(symlink(target.c_str(), d.cacl.c_str()), 0);
-    acl_read r(d.acl, CACHE);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.bytes(), kxtest::example_acl());
-    EXPECT_EQ(r.rflags, TEXT);
-    EXPECT_EQ(kxtest::read_file(target), "n r\n");
-    EXPECT_TRUE(S_ISLNK(kxtest::status_of(d.cacl).st_mode));
-}
-
-TEST(ReadAclFileCache, TooLongForACaclNameIsCompiledAndNotCached) {
+// A path of 4089 characters is the longest whose CACL file is written and
+// then read; longer ones are compiled each time and leave no record.
+TEST(ReadAclFileCache, LongestCachedPathIsReused) {
     std::string base = kxtest::temp_dir();
-    for (std::size_t length : {4090u, 4092u}) {
+    for (std::size_t length : {4089u, 4090u, 4092u}) {
+        SCOPED_TRACE(length);
         std::string under = base + "/" + std::to_string(length);
         ASSERT_EQ(mkdir(under.c_str(), 0755), 0);
         std::string path = kxtest::path_of_length(under, length);
-        kxtest::write_file(path, "o r\n");
+        kxtest::write_file(path, kxtest::example_text);
         kxtest::shift_mtime(path, -10);
-        acl_read r(path, CACHE);
-        ASSERT_EQ(r.status, SEC_S_OK) << length;
-        EXPECT_EQ(r.bytes(), compiled("o r\n"));
-        EXPECT_EQ(r.rflags, TEXT);
+        bool cached = length == 4089;
+        acl_read first(path, CACHE);
+        ASSERT_EQ(first.status, SEC_S_OK);
+        EXPECT_EQ(first.rflags, cached ? TEXT | CACHE : TEXT);
         expect_no_error();
+        acl_read second(path, CACHE);
+        ASSERT_EQ(second.status, SEC_S_OK);
+        EXPECT_EQ(second.rflags, cached ? 0u : TEXT);
+        EXPECT_EQ(second.bytes(), example_acl());
     }
-}
-
-TEST(ReadAclFileCache, LongestCachedPathIsReused) {
-    std::string path = kxtest::path_of_length(kxtest::temp_dir(), 4089);
-    kxtest::write_file(path, kxtest::example_text);
-    kxtest::shift_mtime(path, -10);
-    acl_read first(path, CACHE);
-    ASSERT_EQ(first.status, SEC_S_OK);
-    EXPECT_EQ(first.rflags, TEXT | CACHE);
-    acl_read second(path, CACHE);
-    ASSERT_EQ(second.status, SEC_S_OK);
-    EXPECT_EQ(second.rflags, 0u);
-    EXPECT_EQ(second.bytes(), kxtest::example_acl());
 }
 
 // ---- owner rules with a user name -----------------------------------------
 
 TEST(ReadAclFileUser, FileMustBeTheUsersAndWritableByNobodyElse) {
     KXTEST_REQUIRE_ROOT();
-    std::string home = kxtest::temp_dir();
-    kxtest::scoped_user user(home);
-    if (!user.ok())
+    test_user t;
+    if (!t.user.ok())
         GTEST_SKIP() << "SKIPPED: useradd failed";
-    const char *name = user.name().c_str();
-    uid_t uid = getpwnam(name)->pw_uid;
-    std::string acl = home + "/acl";
+    const char *name = t.user.name().c_str();
+    std::string acl = t.home + "/acl";
     kxtest::write_file(acl, kxtest::example_text, 0644);
 
     acl_read not_owned("acl", CACHE, name);
     EXPECT_EQ(not_owned.status, SEC_S_BAD_PERMISSION);
-    auto e = last_error();
-    EXPECT_EQ(e.msg_num, MSG_2650_141);
-    EXPECT_EQ(e.str(0), acl);
-    EXPECT_EQ(e.str(1), user.name());
+    EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_141, {acl, t.user.name()}));
     EXPECT_EQ(not_owned.rflags, CACHE);
 
-    ASSERT_EQ(chown(acl.c_str(), uid, static_cast<gid_t>(-1)), 0);
+    ASSERT_EQ(chown(acl.c_str(), getpwnam(name)->pw_uid, static_cast<gid_t>(-1)), 0);
     acl_read owned("acl", 0, name);
     ASSERT_EQ(owned.status, SEC_S_OK);
-    EXPECT_EQ(owned.bytes(), kxtest::example_acl());
+    EXPECT_EQ(owned.bytes(), example_acl());
 
     for (mode_t mode : {0664, 0646}) {
         ASSERT_EQ(chmod(acl.c_str(), mode), 0);
         acl_read writable("acl", 0, name);
         EXPECT_EQ(writable.status, SEC_S_BAD_PERMISSION) << std::oct << mode;
-        EXPECT_EQ(last_error().id, SEC_S_BAD_PERMISSION);
+        EXPECT_TRUE(record_is(SEC_S_BAD_PERMISSION, MSG_2650_141, {acl, t.user.name()}));
         EXPECT_TRUE(writable.empty());
     }
 }
 
 TEST(ReadAclFileUser, EmptyFileSucceedsWhateverItsOwnerAndMode) {
     KXTEST_REQUIRE_ROOT();
-    std::string home = kxtest::temp_dir();
-    kxtest::scoped_user user(home);
-    if (!user.ok())
+    test_user t;
+    if (!t.user.ok())
         GTEST_SKIP() << "SKIPPED: useradd failed";
-    kxtest::write_file(home + "/acl", "", 0666); // root's, writable by all
-    acl_read r("acl", CACHE, user.name().c_str());
+    kxtest::write_file(t.home + "/acl", "", 0666); // root's, writable by all
+    acl_read r("acl", CACHE, t.user.name().c_str());
     EXPECT_EQ(r.status, SEC_S_OK);
     EXPECT_TRUE(r.empty());
     EXPECT_EQ(r.rflags, CACHE);
@@ -482,16 +425,13 @@ TEST(ReadAclFileTrace, InfoPointsOfACompileAndOfACachedRead) {
     acl_read second(d.acl, CACHE);
     ASSERT_EQ(second.status, SEC_S_OK);
     auto records = kxtest::read_trace(trace);
-    std::vector<unsigned> ids;
-    for (const auto &r : records)
-        ids.push_back(r.id);
     // 117 examine, 118 absent, 121 open the text, 110 cache absent;
     // then 117 examine, 121 open the CACL file.
-    ASSERT_EQ(ids, (std::vector<unsigned>{117, 118, 121, 110, 117, 121}));
-    EXPECT_EQ(records[0].items, (std::vector<std::string>{kxtest::hex_text(d.cacl)}));
-    EXPECT_EQ(records[1].items[1], kxtest::hex_of(ENOENT));
-    EXPECT_EQ(records[2].items, (std::vector<std::string>{kxtest::hex_text(d.acl)}));
-    EXPECT_EQ(records[5].items, (std::vector<std::string>{kxtest::hex_text(d.cacl)}));
+    ASSERT_EQ(kxtest::trace_ids(trace), (std::vector<unsigned>{117, 118, 121, 110, 117, 121}));
+    EXPECT_EQ(records[0].items, (items{hex_text(d.cacl)}));
+    EXPECT_EQ(records[1].items[1], hex_of(ENOENT));
+    EXPECT_EQ(records[2].items, (items{hex_text(d.acl)}));
+    EXPECT_EQ(records[5].items, (items{hex_text(d.cacl)}));
 }
 
 TEST(ReadAclFileTrace, ForeignCaclFileIsTracedWithBothOwnersAndModes) {
@@ -504,77 +444,54 @@ TEST(ReadAclFileTrace, ForeignCaclFileIsTracedWithBothOwnersAndModes) {
     ASSERT_GE(records.size(), 2u);
     EXPECT_EQ(records[1].id, 120u);
     ASSERT_EQ(records[1].items.size(), 7u);
-    EXPECT_EQ(records[1].items[0], kxtest::hex_text(d.acl));
-    EXPECT_EQ(records[1].items[5], kxtest::hex_of(kx_uint32_t{S_IFREG | 0644}));
-    EXPECT_EQ(records[1].items[6], kxtest::hex_of(kx_uint32_t{S_IFREG | 0600}));
+    EXPECT_EQ(records[1].items[0], hex_text(d.acl));
+    EXPECT_EQ(records[1].items[5], hex_of(kx_uint32_t{S_IFREG | 0644}));
+    EXPECT_EQ(records[1].items[6], hex_of(kx_uint32_t{S_IFREG | 0600}));
 }
 
-TEST(ReadAclFileTrace, EveryConsumedLineAtInfoEight) {
-    std::string trace = kxtest::start_tracing("_SEL:Info=8");
-    acl_dir d("o r\n# c\ng staff rw\n");
-    acl_read r(d.acl, TEXT);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    std::vector<std::vector<std::string>> lines;
-    for (const auto &rec : kxtest::read_trace(trace))
-        if (rec.id == 114)
-            lines.push_back(rec.items);
-    using kxtest::hex_of;
-    using kxtest::hex_text;
-    ASSERT_EQ(lines.size(), 3u);
-    EXPECT_EQ(lines[0], (std::vector<std::string>{hex_of(1), hex_of(2), hex_text(""), hex_text(""),
-                                                  hex_of(kx_uint32_t{1})}));
-    EXPECT_EQ(lines[1], (std::vector<std::string>{hex_of(2), hex_of(0), hex_text(""), hex_text(""),
-                                                  hex_of(kx_uint32_t{0})}));
-    EXPECT_EQ(lines[2], (std::vector<std::string>{hex_of(3), hex_of(16), hex_text(""),
-                                                  hex_text("staff"), hex_of(kx_uint32_t{3})}));
-}
-
+// The API points carry the arguments and the line reached; at Info 8 every
+// consumed line is traced with its number, type, mechanism, identity and mask.
 TEST(ReadAclFileTrace, ApiPointsCarryTheArgumentsAndTheLineReached) {
-    std::string trace = kxtest::start_tracing("_SEL:API=8");
+    std::string trace = kxtest::start_tracing("_SEL:API=8,Info=8");
     acl_dir d("o r\n# c\ng staff rw\n");
     sec_buffer_s acl{0, nullptr};
     kx_uint32_t rflags = 0;
     ASSERT_EQ(sec_read_acl_file(d.acl.c_str(), nullptr, nullptr, TEXT, &acl, &rflags), SEC_S_OK);
     std::free(acl.value);
-    std::vector<kxtest::trace_record> records;
+    std::vector<kxtest::trace_record> api, lines;
     for (const auto &rec : kxtest::read_trace(trace))
-        if (rec.id == 11 || rec.id == 14)
-            records.push_back(rec);
-    ASSERT_EQ(records.size(), 2u);
+        (rec.id == 114 ? lines : api).push_back(rec);
     sec_buffer_t acl_pointer = &acl;
     sec_perm_set_t no_set = nullptr;
-    EXPECT_EQ(records[0].id, 11u);
-    EXPECT_EQ(records[0].items,
-              (std::vector<std::string>{kxtest::hex_text(d.acl), kxtest::hex_text(""),
-                                        kxtest::hex_of(no_set), kxtest::hex_of(TEXT),
-                                        kxtest::hex_of(acl_pointer)}));
-    EXPECT_EQ(records[1].id, 14u);
-    EXPECT_EQ(records[1].items,
-              (std::vector<std::string>{kxtest::hex_of(kx_int32_t{0}), kxtest::hex_of(4)}));
+    ASSERT_EQ(api.front().id, 11u);
+    EXPECT_EQ(api.front().items, (items{hex_text(d.acl), hex_text(""), hex_of(no_set), hex_of(TEXT),
+                                        hex_of(acl_pointer)}));
+    ASSERT_EQ(api.back().id, 14u);
+    EXPECT_EQ(api.back().items, (items{hex_of(kx_int32_t{0}), hex_of(4)}));
+    ASSERT_EQ(lines.size(), 3u);
+    EXPECT_EQ(lines[0].items,
+              (items{hex_of(1), hex_of(2), hex_text(""), hex_text(""), hex_of(kx_uint32_t{1})}));
+    EXPECT_EQ(lines[1].items,
+              (items{hex_of(2), hex_of(0), hex_text(""), hex_text(""), hex_of(kx_uint32_t{0})}));
+    EXPECT_EQ(lines[2].items, (items{hex_of(3), hex_of(16), hex_text(""), hex_text("staff"),
+                                     hex_of(kx_uint32_t{3})}));
 }
 
+// Perf 1 times the compile's steps; Perf 2 the opening and reading alone.
 TEST(ReadAclFileTrace, PerfPointsOfACompile) {
     std::string trace = kxtest::start_tracing("_SEL:Perf=1");
     acl_dir d;
     acl_read r(d.acl, TEXT);
     ASSERT_EQ(r.status, SEC_S_OK);
+    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Perf", 2), TR_OK);
+    acl_read again(d.acl, TEXT);
+    ASSERT_EQ(again.status, SEC_S_OK);
     auto records = kxtest::read_trace(trace);
-    std::vector<unsigned> ids;
-    for (const auto &rec : records)
-        ids.push_back(rec.id);
-    ASSERT_EQ(ids, (std::vector<unsigned>{0, 1, 2, 3}));
+    ASSERT_EQ(kxtest::trace_ids(trace), (std::vector<unsigned>{0, 1, 2, 3, 4, 6}));
     EXPECT_EQ(records[1].items.size(), 4u);
     EXPECT_EQ(records[2].items.size(), 4u);
     ASSERT_EQ(records[3].items.size(), 5u);
-    EXPECT_EQ(records[3].items[1], kxtest::hex_of(4));
-}
-
-TEST(ReadAclFileTrace, PerfPointsOfOpeningAndReading) {
-    std::string trace = kxtest::start_tracing("_SEL:Perf=2");
-    acl_dir d;
-    acl_read r(d.acl, TEXT);
-    ASSERT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(kxtest::trace_ids(trace), (std::vector<unsigned>{0, 4, 6}));
+    EXPECT_EQ(records[3].items[1], hex_of(4));
 }
 
 } // namespace

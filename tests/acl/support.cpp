@@ -60,6 +60,17 @@ error_record last_error() {
     return r;
 }
 
+testing::AssertionResult record_is(int status, int msg_num, const std::vector<arg> &args) {
+    error_record e = last_error();
+    if (e.id == status && e.msg_num == msg_num && e.args == args)
+        return testing::AssertionSuccess();
+    testing::AssertionResult failure = testing::AssertionFailure();
+    failure << "record has status " << e.id << ", message " << e.msg_num << ", arguments";
+    for (const arg &a : e.args)
+        std::visit([&](const auto &v) { failure << " " << testing::PrintToString(v); }, a);
+    return failure << ": " << e.text;
+}
+
 std::string temp_dir() {
     const char *base = std::getenv("TMPDIR");
     std::string templ = std::string(base ? base : "/tmp") + "/kxacl-test-XXXXXX";

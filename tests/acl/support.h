@@ -1,11 +1,13 @@
-// Helpers of the library's tests: reading the thread's error record back,
-// and reading trace records from a trace file.
+// Helpers of the library's tests: reading the thread's error record back
+// and checking it, and reading trace records from a trace file.
 #ifndef KXACL_TEST_SUPPORT_H
 #define KXACL_TEST_SUPPORT_H
 
 #include <string>
 #include <variant>
 #include <vector>
+
+#include <gtest/gtest.h>
 
 #include <kx_cu.h>
 
@@ -26,6 +28,11 @@ struct error_record {
 };
 
 error_record last_error();
+
+// Whether the thread's record holds message msg_num with status and exactly
+// these arguments (numbers and texts).
+using arg = std::variant<long long, std::string>;
+testing::AssertionResult record_is(int status, int msg_num, const std::vector<arg> &args);
 
 // One record of the trace file: its id and its items as hex texts.
 struct trace_record {

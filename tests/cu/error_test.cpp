@@ -29,11 +29,8 @@ void expect_no_error(const cu_error_t *err) {
     EXPECT_EQ(err->cu_msg_default, nullptr);
 }
 
-TEST_F(ErrorRecordTest, NothingSetGivesZeroedRecord) {
-    expect_no_error(current_error().get());
-}
-
 TEST_F(ErrorRecordTest, RoundTripKeepsEveryField) {
+    expect_no_error(current_error().get()); // nothing set yet
     const char *text = "2650-101 Function name: %1$s\n\tParameter value: 0x%3$x\n";
     ASSERT_EQ(cu_set_error_1(4, "ffdc-1", "kxseclib.cat", 1, 101, text, "sec_list_acl", 2, 0), 0);
     ErrorPtr err = current_error();
@@ -77,11 +74,10 @@ TEST_F(ErrorRecordTest, ConversionsChooseArgumentKinds) {
     EXPECT_EQ(a[6].cu_arg_value.cu_arg_double, 0.25); // passed as long double
     EXPECT_EQ(a[7].cu_arg_value.cu_arg_int, 300);
     EXPECT_EQ(a[8].cu_arg_value.cu_arg_long, 9L);
-}
 
-TEST_F(ErrorRecordTest, UnnumberedPlaceholdersTakeArgumentsInTextOrder) {
+    // Unnumbered placeholders take the arguments in text order.
     ASSERT_EQ(cu_set_error_1(7, nullptr, nullptr, 0, 0, "%s=%d (%lx)", "key", 3, 0xABL), 0);
-    ErrorPtr err = current_error();
+    err = current_error();
     ASSERT_EQ(err->cu_arg_cnt, 3u);
     EXPECT_STREQ(err->cu_args[0].cu_arg_value.cu_arg_char_str, "key");
     EXPECT_EQ(err->cu_args[1].cu_arg_value.cu_arg_int, 3);

@@ -48,20 +48,6 @@ std::string format_with(const char *text, std::vector<cu_error_arg_t> args) {
     return message_of(&err);
 }
 
-TEST_F(MessageTest, LibraryMessageIsFormattedExactly) {
-    ASSERT_EQ(cu_set_error_1(4, nullptr, "kxcu-none.cat", 1, 101,
-                             "2650-101 Failure: incorrect parameters provided.\n"
-                             "\tFunction name: %1$s\n"
-                             "\tPositional parameter number: %2$d\n"
-                             "\tParameter value: 0x%3$x\n",
-                             "sec_list_acl", 2, 0),
-              0);
-    EXPECT_EQ(current_message(), "2650-101 Failure: incorrect parameters provided.\n"
-                                 "\tFunction name: sec_list_acl\n"
-                                 "\tPositional parameter number: 2\n"
-                                 "\tParameter value: 0x0\n");
-}
-
 TEST_F(MessageTest, IntegerConversionsHonourFlagsWidthAndLength) {
     ASSERT_EQ(cu_set_error_1(1, nullptr, nullptr, 0, 0,
                              "[%1$08x][%2$c][%3$-5d][%4$+d][%5$X][%6$#o][%7$u][%8$hhx][%9$ld]"
@@ -94,25 +80,18 @@ TEST_F(MessageTest, ConversionNotSuitingTheArgumentIsCopied) {
     EXPECT_EQ(
         format_with("%1$s|%1$p|%1$f|%1$ld|%1$lld|%2$d|%2$c|%1$d|%2$s", {int_arg(7), text_arg("t")}),
         "%1$s|%1$p|%1$f|%1$ld|%1$lld|%2$d|%2$c|7|t");
-}
-
-TEST_F(MessageTest, PlaceholderWithoutArgumentIsCopied) {
+    // So is a placeholder without argument, and a text that is no placeholder.
     EXPECT_EQ(format_with("a %1$d b %2$-3s c %99$x d %s %s", {int_arg(5)}),
               "a 5 b %2$-3s c %99$x d %s %s");
-    // A count without an argument array must not be followed.
-    cu_error_t err = {3, nullptr, nullptr, 0, 0, const_cast<char *>("v=%1$d"), 4, nullptr};
-    EXPECT_EQ(message_of(&err), "v=%1$d");
-}
-
-TEST_F(MessageTest, TextsThatAreNoPlaceholdersAreCopied) {
     EXPECT_EQ(
         format_with("%n %1$n %q %*d %1$Ld %1$ls %0$d %100$d %1$99999d trailing %", {int_arg(1)}),
         "%n %1$n %q %*d %1$Ld %1$ls %0$d %100$d %1$99999d trailing %");
-}
-
-TEST_F(MessageTest, NoRecordOrNoTextGivesEmptyText) {
+    // A count without an argument array must not be followed.
+    cu_error_t err = {3, nullptr, nullptr, 0, 0, const_cast<char *>("v=%1$d"), 4, nullptr};
+    EXPECT_EQ(message_of(&err), "v=%1$d");
+    // No record or no text gives an empty text.
     EXPECT_EQ(message_of(nullptr), "");
-    cu_error_t err = {3, nullptr, nullptr, 0, 0, nullptr, 0, nullptr};
+    err.cu_msg_default = nullptr;
     EXPECT_EQ(message_of(&err), "");
 }
 
@@ -148,6 +127,9 @@ TEST_F(CatalogueTest, TranslatedTextReplacesTheDefault) {
                              "sec_list_acl", 2, 255),
               0);
     EXPECT_EQ(current_message(), "Übersetzt: 2 von sec_list_acl ist 0xff.\n");
+    // The translation wants two texts; the record holds an int and a text.
+    ASSERT_EQ(cu_set_error_1(4, nullptr, "kxcutest.cat", 1, 102, "default %1$d %2$s", 77, "t"), 0);
+    EXPECT_EQ(current_message(), "Böswillig: %1$s t");
 }
 
 TEST_F(CatalogueTest, DefaultIsUsedWhenTheCatalogueLacksTheMessage) {
@@ -157,12 +139,6 @@ TEST_F(CatalogueTest, DefaultIsUsedWhenTheCatalogueLacksTheMessage) {
     EXPECT_EQ(current_message(), "other set 6");
     ASSERT_EQ(cu_set_error_1(4, nullptr, "kxcu-absent.cat", 1, 101, "no catalogue"), 0);
     EXPECT_EQ(current_message(), "no catalogue");
-}
-
-TEST_F(CatalogueTest, TranslationCannotMakeFormattingReadAWrongArgument) {
-    // The translation wants two texts; the record holds an int and a text.
-    ASSERT_EQ(cu_set_error_1(4, nullptr, "kxcutest.cat", 1, 102, "default %1$d %2$s", 77, "t"), 0);
-    EXPECT_EQ(current_message(), "Böswillig: %1$s t");
 }
 
 } // namespace

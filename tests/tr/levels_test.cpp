@@ -101,22 +101,12 @@ TEST_F(Levels, GarbageAndOverlongConfigurationIsSafe) {
     EXPECT_EQ(levels[1], 6);
 }
 
+// Set changes the named categories of its component only, and refuses what
+// it cannot name, keeping errno.
 TEST_F(Levels, SetChangesNamedCategoriesOfItsComponentOnly) {
     levels_t other = untouched;
     ASSERT_EQ(register_as("_TST", levels), TR_OK);
     ASSERT_EQ(register_as("_TWO", other), TR_OK);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "api", 5), TR_OK);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "Perf", 0), TR_OK);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "Errors", 200), TR_OK);
-    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
-    EXPECT_EQ(tr_set_detail_level_1("_TWO", "*", 0), TR_OK);
-    EXPECT_EQ(other, minimums);
-    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
-    EXPECT_EQ(tr_unregister_component_1("_TWO"), TR_OK);
-}
-
-TEST_F(Levels, SetRefusesWhatItCannotNameAndKeepsErrno) {
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
     errno = 4242;
     EXPECT_EQ(tr_set_detail_level_1("_tst", "API", 5), TR_NOT_REGISTERED);
     EXPECT_EQ(tr_set_detail_level_1("_TST", "Nope", 5), TR_BAD_ARGUMENT);
@@ -125,6 +115,14 @@ TEST_F(Levels, SetRefusesWhatItCannotNameAndKeepsErrno) {
     EXPECT_EQ(tr_set_detail_level_1("_TST", nullptr, 5), TR_BAD_ARGUMENT);
     EXPECT_EQ(errno, 4242);
     EXPECT_EQ(levels, defaults);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "api", 5), TR_OK);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "Perf", 0), TR_OK);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "Errors", 200), TR_OK);
+    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
+    EXPECT_EQ(tr_set_detail_level_1("_TWO", "*", 0), TR_OK);
+    EXPECT_EQ(other, minimums);
+    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
+    EXPECT_EQ(tr_unregister_component_1("_TWO"), TR_OK);
 }
 
 // The registry keeps its own copies of the names.

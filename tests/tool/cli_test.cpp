@@ -1,0 +1,161 @@
+// The command line, template file and JSON text of kxacl, without running it.
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+#include "json.h"
+#include "options.h"
+#include "templates.h"
+
+namespace kxtool {
+namespace {
+
+parsed parse(std::vector<const char *> args) {
+    return parse_command_line(std::span<const char *const>(args.data(), args.size()));
+}
+
+TEST(CommandLine, GroupNamesRunToTheNextOption) {
+    const parsed p = parse({"check", "acl", "--group", "a", "b", "--json", "--group", "c"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.cmd, command::check);
+    EXPECT_EQ(p.inv.input, "acl");
+    EXPECT_TRUE(p.inv.json);
+    EXPECT_EQ(p.inv.who.type, 'g');
+    EXPECT_EQ(p.inv.who.ids, (std::vector<std::string>{"a", "b", "c"}));
+    EXPECT_EQ(parse({"add", "buf", "--group", "a", "b"}).error, "--group takes one name here");
+}
+
+TEST(CommandLine, UserIsTheOwnerForCompileAndARequesterElsewhere) {
+    parsed p = parse({"compile", "f", "--user", "bob", "--cache", "-o", "out"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.owner, "bob");
+    EXPECT_TRUE(p.inv.cache);
+    EXPECT_EQ(p.inv.output, "out");
+    EXPECT_EQ(p.inv.who.type, 0);
+    p = parse({"check", "f", "--user", "unix", "bob@h"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.who.type, 'u');
+    EXPECT_EQ(p.inv.who.mech, "unix");
+    EXPECT_EQ(p.inv.who.ids, std::vector<std::string>{"bob@h"});
+    EXPECT_EQ(parse({"check", "f", "--user=unix"}).error,
+              "option --user takes MECH ID as two arguments");
+}
+
+TEST(CommandLine, ValuesInlineOrSeparateAndDashDash) {
+    parsed p = parse({"--json", "list", "--type=user", "--mech", "unix", "--", "-odd-name"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.list_type, 'u');
+    EXPECT_EQ(p.inv.list_mech, "unix");
+    EXPECT_EQ(p.inv.input, "-odd-name");
+    p = parse({"perms", "--string", "--templates=t", "--", "-r"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.perms_arg, "-r");
+    EXPECT_EQ(p.inv.perms_as, perms_mode::string);
+    EXPECT_EQ(p.inv.templates, "t");
+}
+
+TEST(CommandLine, MistakesAreNamed) {
+    const std::pair<std::vector<const char *>, const char *> cases[] = {
+        {{}, "no command given"},
+        {{"list"}, "list needs a file"},
+        {{"list", "a", "b"}, "unexpected argument 'b'"},
+        {{"list", "a", "--cache"}, "unknown option --cache for list"},
+        {{"--cache", "compile"}, "unknown option --cache (before the command)"},
+        {{"list", "a", "--type"}, "option --type needs a value"},
+        {{"list", "a", "--type", "x"}, "unknown entry type 'x'"},
+        {{"list", "a", "--mech", "unix"}, "--mech needs --type user or --type expanded"},
+        {{"list", "a", "--buffer", "--owner", "u"},
+         "--owner applies to ACL text files, not to buffers"},
+        {{"check", "a"},
+         "check needs one of --unauthenticated, --anyother, --user, --expanded, "
+         "--group"},
+        {{"check", "a", "--anyother", "--unauthenticated"},
+         "give one of --unauthenticated, --anyother, --user, --expanded, --group"},
+        {{"del", "a", "--json=yes", "--anyother"}, "option --json takes no value"},
+        {{"perms", "--mask"}, "--string and --mask need an argument"},
+        {{"frob"}, "unknown command 'frob'"},
+    };
+    for (const auto &[args, error] : cases)
+        EXPECT_EQ(parse(args).error, error);
+    // Help wins over whatever else is missing.
+    EXPECT_TRUE(parse({"check", "--help"}).inv.help);
+    EXPECT_EQ(parse({"check", "--help"}).error, "");
+}
+
+TEST(CommandLine, TypeNamesAndLetters) {
+    EXPECT_EQ(type_letter("unauthenticated"), 'n');
+    EXPECT_EQ(type_letter("G"), 'g');
+    EXPECT_EQ(type_letter("e"), 'e');
+    EXPECT_EQ(type_letter("users"), 0);
+    EXPECT_EQ(type_letter(""), 0);
+}
+
+TEST(TemplateFile, ParsesCommentsBlanksAndHelpText) {
+    template_set set;
+    std::string error;
+    ASSERT_TRUE(parse_templates("# perms\n\n  r 0 read  Read the thing \n"
+                                "W 31 write\t\n",
+                                set, error))
+        << error;
+    ASSERT_EQ(set.perms.size(), 2u);
+    EXPECT_EQ(set.perms[0].printchar, 'r');
+    EXPECT_EQ(set.perms[0].code, 1u);
+    EXPECT_STREQ(set.perms[0].printstring, "read");
+    EXPECT_STREQ(set.perms[0].printhelp, "Read the thing");
+    EXPECT_EQ(set.perms[1].code, 0x80000000u);
+    EXPECT_STREQ(set.perms[1].printhelp, "");
+    sec_perm_set_t lib = set.get();
+    ASSERT_NE(lib, nullptr);
+    EXPECT_EQ(lib->count, 2);
+    EXPECT_EQ(lib->perms, set.perms.data());
+}
+
+TEST(TemplateFile, BadLinesAreNamedAndBoundsHeld) {
+    const std::string name13(13, 'n'), help63(63, 'h');
+    template_set set;
+    std::string error;
+    EXPECT_TRUE(parse_templates("x 1 " + name13 + " " + help63 + "\n", set, error)) << error;
+    EXPECT_EQ(std::strlen(set.perms[0].printstring), 13u);
+    EXPECT_EQ(std::strlen(set.perms[0].printhelp), 63u);
+
+    const std::pair<std::string, std::string> cases[] = {
+        {"r 0\n", "line 1: expected CHAR BIT NAME [HELP]"},
+        {"\nrw 0 read\n", "line 2: the permission character must be one printable character"},
+        {"\x01 0 read\n", "line 1: the permission character must be one printable character"},
+        {"r 32 read\n", "line 1: the bit must be a number from 0 to 31"},
+        {"r -1 read\n", "line 1: the bit must be a number from 0 to 31"},
+        {"r 007 read\n", "line 1: the bit must be a number from 0 to 31"},
+        {"r 1 " + name13 + "n\n", "line 1: the name is longer than 13 bytes"},
+        {"r 1 n " + help63 + "h\n", "line 1: the help text is longer than 63 bytes"},
+        {"r 1 a\nr 2 b\n", "line 2: the character 'r' is used twice"},
+        {"r 1 a\nw 1 b\n", "line 2: bit 1 is used twice"},
+        {"# nothing\n\n", "no permission template in the file"},
+        {std::string("r 1 a\0\n", 7), "the file holds a NUL byte"},
+    };
+    for (const auto &[text, why] : cases) {
+        EXPECT_FALSE(parse_templates(text, set, error)) << text;
+        EXPECT_EQ(error, why);
+        EXPECT_TRUE(set.perms.empty());
+    }
+}
+
+TEST(JsonText, EscapesAndKeepsValidUtf8Only) {
+    EXPECT_EQ(json_quote("a\"b\\c\n\t\x01"), "\"a\\\"b\\\\c\\n\\t\\u0001\"");
+    EXPECT_EQ(json_quote("caf\xc3\xa9 \xe2\x82\xac \xf0\x9f\x94\x92"),
+              "\"caf\xc3\xa9 \xe2\x82\xac \xf0\x9f\x94\x92\"");
+    // A stray continuation byte, an overlong form, a surrogate, a cut sequence.
+    EXPECT_EQ(json_quote("\x80"), "\"\\ufffd\"");
+    EXPECT_EQ(json_quote("\xc0\xaf"), "\"\\ufffd\\ufffd\"");
+    EXPECT_EQ(json_quote("\xed\xa0\x80"), "\"\\ufffd\\ufffd\\ufffd\"");
+    EXPECT_EQ(json_quote("x\xe2\x82"), "\"x\\ufffd\\ufffd\"");
+}
+
+TEST(JsonText, WriterPlacesCommas) {
+    json_writer j;
+    j.begin_object().key("a").begin_array().value(std::int64_t{1}).value(true).null();
+    j.begin_object().end_object().end_array().key("b").value("x").end_object();
+    EXPECT_EQ(j.str(), "{\"a\":[1,true,null,{}],\"b\":\"x\"}\n");
+}
+
+} // namespace
+} // namespace kxtool

@@ -1,0 +1,74 @@
+// The command line of kxacl: what the user asked for, as plain values.
+// Parsing is separate from running so that it can be tested and fuzzed on
+// its own; it touches no file and calls nothing of the library.
+#ifndef KXACL_TOOL_OPTIONS_H
+#define KXACL_TOOL_OPTIONS_H
+
+#include <optional>
+#include <span>
+#include <string>
+#include <vector>
+
+namespace kxtool {
+
+enum class command { none, compile, check, list, add, del, dump, perms };
+
+// How an input file is taken: by its first byte, or as the user says.
+enum class input_kind { detect, text, buffer };
+
+// How the argument of `perms` is taken.
+enum class perms_mode { detect, string, mask };
+
+// An entry or a requester: a type letter (n, o, u, e, g) with its mechanism
+// and identity where the type has them. Groups may name several identities.
+struct identity {
+    char type = 0;
+    std::string mech;
+    std::vector<std::string> ids;
+};
+
+struct invocation {
+    command cmd = command::none;
+    bool help = false;
+    bool version = false;
+    bool json = false;
+
+    std::string input;     // the ACL file or buffer file
+    std::string owner;     // the user who must own the ACL file
+    std::string templates; // a permission template file
+    std::string output;    // -o: where a buffer is written
+    input_kind kind = input_kind::detect;
+
+    bool cache = false;    // compile: write the cached compiled file
+    bool add_only = false; // add: an existing entry is a failure
+
+    identity who;          // check, add, del
+    std::string perm;      // add: the permissions of the entry
+    char list_type = 0;    // list: only this type
+    std::string list_mech; // list: only this mechanism
+
+    std::string perms_arg; // perms: a permission string or a mask
+    perms_mode perms_as = perms_mode::detect;
+};
+
+// The parse result: the invocation, or the reason it is not one.
+struct parsed {
+    invocation inv;
+    std::string error; // empty on success
+};
+
+// Parses argv[1..]; args excludes the program name.
+parsed parse_command_line(std::span<const char *const> args);
+
+// The name of a command as typed, and the type letter of a type name
+// ("user" or "u" give 'u'); 0 when unknown.
+const char *command_name(command cmd);
+char type_letter(const std::string &name);
+
+// Usage texts: the summary of every command, and one command's help.
+const char *usage_summary();
+const char *command_help(command cmd);
+
+} // namespace kxtool
+
+#endif
