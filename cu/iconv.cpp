@@ -280,12 +280,10 @@ bool env_is_true(const char *name) noexcept {
                        [value](const char *y) { return cu_strcasecmp_posix_1(value, y) == 0; });
 }
 
-// Read by the exported getters at the end of this file, which cppcheck 2.10
-// does not follow there.
 struct Utf8Settings {
-    bool assumed;  // cppcheck-suppress unusedStructMember
-    bool standard; // cppcheck-suppress unusedStructMember
-    bool bmp_only; // cppcheck-suppress unusedStructMember
+    bool assumed;
+    bool standard;
+    bool bmp_only;
 };
 
 const Utf8Settings &utf8_settings() noexcept {
