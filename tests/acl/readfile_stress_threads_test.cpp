@@ -14,6 +14,7 @@
 #include <kx_cu.h>
 
 #include "file_helpers.h"
+#include "messages.h"
 
 using namespace kxtest;
 
@@ -27,10 +28,16 @@ kx_int32_t same_user(char *id, char *acle_id) {
     return cu_strcasecmp_posix_1(id, acle_id);
 }
 
-// Everything a reader does with one read; false when anything is off.
+// Everything a reader does with one read; false when anything is off. A
+// reader that finds the file replaced under it on every one of its retries
+// gives up with 2650-139, which a slow scheduler (valgrind, the sanitizers)
+// can bring about: that is an answer, not a fault.
 bool read_list_and_evaluate(const std::string &path, const std::string &a, const std::string &b,
                             std::string *what) {
     acl_read r(path, CACHE | CONVERT);
+    if (r.status == SEC_S_FILE_ERROR && last_error().msg_num == kxacl::MSG_2650_139 &&
+        last_error().num(0) == 0)
+        return true;
     if (r.status != SEC_S_OK || (r.bytes() != a && r.bytes() != b)) {
         *what = "read: " + std::to_string(r.status) + " " + last_error().text;
         return false;
