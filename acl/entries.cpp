@@ -113,6 +113,8 @@ kx_int32_t create_acle(unsigned char type, kx_uint32_t perm, const char *mech, c
     kx_int32_t rc = check_create_args(type, mech, id, acle);
     if (rc != SEC_S_OK)
         return rc;
+    // No entry on any later failure, the identity's own included.
+    *acle = nullptr;
     unique_mem<char> normalised;
     if (type_has_mech(type) && mech_has_host_identities(mech)) {
         rc = normalise_host_identity(type, id, &normalised);

@@ -157,6 +157,21 @@ TEST(DisplayAcle, Failures) {
     EXPECT_EQ(std::string(full.mech), std::string(16, 'm'));
 }
 
+// Found by failing each allocation of the process: when the identity's
+// host part could not be normalised (no memory, or a user identity without
+// '@'), the caller's pointer was left as it was instead of null.
+TEST(CreateAcle, FailedIdentityNormalisationLeavesNoEntry) {
+    sec_acle_t acle = reinterpret_cast<sec_acle_t>(1);
+    kxacl::mem_fail_after(0);
+    EXPECT_EQ(sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@0:0:0:0:0:0:0:1", &acle),
+              SEC_S_NO_MEMORY);
+    kxacl::mem_fail_after(-1);
+    EXPECT_EQ(acle, nullptr);
+    acle = reinterpret_cast<sec_acle_t>(1);
+    EXPECT_EQ(sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob", &acle), SEC_S_BAD_PARAM);
+    EXPECT_EQ(acle, nullptr);
+}
+
 // Every allocation of entry creation may fail: the failure is reported
 // with its routine and size, and no entry is handed out.
 TEST(CreateAcle, EveryAllocationFailureIsReported) {
