@@ -1,0 +1,181 @@
+// Every heap allocation of the process fails in turn while an exported
+// function runs: the library's own, and those of libkx_cu (converted texts)
+// and of the C library (the converters), which mem_fail_after cannot reach.
+// One allocation fails at a time; the call then succeeds or fails with
+// 2650-102, and leaves the caller's outputs as it promises. An executable
+// of its own because it replaces the allocator of the whole process; not
+// built under the sanitizers, which bring their own, and left out of the
+// valgrind run, whose own allocator bypasses this one.
+#include <atomic>
+#include <cerrno>
+#include <cstddef>
+#include <cstdio>
+#include <functional>
+
+#include <gtest/gtest.h>
+
+#include "acl_fixtures.h"
+#include "file_helpers.h"
+
+extern "C" {
+void *__libc_malloc(std::size_t size);
+void *__libc_calloc(std::size_t count, std::size_t size);
+void *__libc_realloc(void *p, std::size_t size);
+}
+
+namespace {
+std::atomic<bool> armed{false};
+std::atomic<long> to_pass{0};
+std::atomic<bool> fired{false};
+
+bool refuse() {
+    if (!armed.load(std::memory_order_relaxed) || to_pass.fetch_sub(1) != 0)
+        return false;
+    armed = false;
+    fired = true;
+    errno = ENOMEM;
+    return true;
+}
+} // namespace
+
+extern "C" {
+void *malloc(std::size_t size) noexcept {
+    return refuse() ? nullptr : __libc_malloc(size);
+}
+void *calloc(std::size_t count, std::size_t size) noexcept {
+    return refuse() ? nullptr : __libc_calloc(count, size);
+}
+void *realloc(void *p, std::size_t size) noexcept {
+    return refuse() ? nullptr : __libc_realloc(p, size);
+}
+}
+
+namespace {
+
+using namespace kxtest;
+
+// Runs f with allocation n of the process failing, counted from its start.
+template <typename F> kx_int32_t failing(long n, F f) {
+    fired = false;
+    to_pass = n;
+    armed = true;
+    kx_int32_t rc = f();
+    armed = false;
+    return rc;
+}
+
+// One function: call(n) prepares its inputs, runs the function through
+// failing(n, ...) and checks what it leaves on failure.
+struct row {
+    const char *function;
+    std::function<kx_int32_t(long n)> call;
+};
+
+// False when the call made fewer than n + 1 allocations.
+bool with_failed_allocation(long n, const row &r) {
+    kx_int32_t rc = r.call(n);
+    if (!fired)
+        return false;
+    EXPECT_TRUE(rc == SEC_S_OK || rc == SEC_S_NO_MEMORY) << rc << " " << last_error().text;
+    if (rc == SEC_S_NO_MEMORY) {
+        EXPECT_EQ(last_error().msg_num, kxacl::MSG_2650_102);
+    }
+    return true;
+}
+
+TEST(ProcessAllocationFailure, EveryAllocationOfEachCall) {
+    // The converters open once per process: open them before anything fails.
+    sec_acle_t warm = nullptr;
+    ASSERT_EQ(sec_create_acle(SEC_ACLE_GROUP, 1, nullptr, "staff", &warm), SEC_S_OK);
+    char *m = nullptr, *i = nullptr;
+    ASSERT_EQ(sec_display_acle_id(warm, &m, &i), SEC_S_OK);
+    std::free(i);
+    sec_release_acle(warm);
+
+    sec_acle_t user = nullptr;
+    ASSERT_EQ(sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@node", &user), SEC_S_OK);
+    bytes rich = rich_acl();
+    acl_dir d;
+    std::string compiled = acl_read(d.acl, TEXT).bytes();
+
+    const std::vector<row> rows = {
+        {"sec_create_acle",
+         [](long n) {
+             sec_acle_t made = reinterpret_cast<sec_acle_t>(1);
+             kx_int32_t rc = failing(n, [&] {
+                 return sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@0:0:0:0:0:0:0:1", &made);
+             });
+             EXPECT_TRUE(rc == SEC_S_OK || made == nullptr) << rc << " " << last_error().text;
+             sec_release_acle(rc == SEC_S_OK ? made : nullptr);
+             return rc;
+         }},
+        {"sec_display_acle_id",
+         [&](long n) {
+             char *mech = nullptr, *id = nullptr;
+             kx_int32_t rc = failing(n, [&] { return sec_display_acle_id(user, &mech, &id); });
+             EXPECT_TRUE(rc == SEC_S_OK || (!mech && !id));
+             std::free(mech);
+             std::free(id);
+             return rc;
+         }},
+        {"sec_list_acl",
+         [&](long n) {
+             owned_acl acl(rich);
+             owned_list list;
+             kx_int32_t rc = failing(n, [&] { return sec_list_acl(acl.get(), list.get()); });
+             EXPECT_TRUE(rc == SEC_S_OK || (list.l.count == 0 && !list.l.acles));
+             return rc;
+         }},
+        {"sec_add_acle_to_acl",
+         [&](long n) {
+             owned_acl acl(rich);
+             entry e{SEC_ACLE_USER, 1, "krb5", "carol@REALM"};
+             kx_int32_t rc = failing(n, [&] { return sec_add_acle_to_acl(e.p(), acl.get()); });
+             EXPECT_TRUE(rc == SEC_S_OK || acl.contents() == rich);
+             return rc;
+         }},
+        {"sec_read_acl_file",
+         [&](long n) {
+             unlink(d.cacl.c_str());
+             sec_buffer_s acl{0, nullptr};
+             kx_uint32_t rflags = 0;
+             kx_int32_t rc = failing(n, [&] {
+                 return sec_read_acl_file(d.acl.c_str(), nullptr, nullptr, CACHE, &acl, &rflags);
+             });
+             std::string got = acl.value ? std::string(static_cast<char *>(acl.value),
+                                                       static_cast<std::size_t>(acl.length))
+                                         : std::string();
+             std::free(acl.value);
+             EXPECT_TRUE(rc == SEC_S_OK ? got == compiled : acl.length == 0 && !acl.value);
+             std::string cacl = read_file(d.cacl);
+             EXPECT_TRUE(cacl == "<missing>" || cacl == compiled);
+             for (const std::string &name : dir_entries(d.dir))
+                 EXPECT_TRUE(name == "acl" || name == "acl.cacl") << name;
+             return rc;
+         }},
+        {"sec__dump_acl",
+         [&](long n) {
+             owned_acl acl(rich);
+             std::FILE *out = stdout, *err = stderr, *null_stream = std::fopen("/dev/null", "w");
+             stdout = stderr = null_stream;
+             failing(n, [&] {
+                 sec__dump_acl(acl.get());
+                 return SEC_S_OK;
+             });
+             stdout = out;
+             stderr = err;
+             std::fclose(null_stream);
+             return SEC_S_OK;
+         }},
+    };
+    for (const row &r : rows) {
+        SCOPED_TRACE(r.function);
+        long n = 0;
+        while (with_failed_allocation(n, r))
+            ++n;
+        EXPECT_GT(n, 0) << "no allocation to fail";
+    }
+    sec_release_acle(user);
+}
+
+} // namespace
