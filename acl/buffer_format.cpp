@@ -58,6 +58,10 @@ bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v) {
     return true;
 }
 
+bool subacl_length_covers_header(const subacl_view &v) {
+    return v.length >= v.first_entry - v.offset;
+}
+
 acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last) {
     return {b.data, last ? b.size : std::min(b.size, v.end())};
 }
@@ -212,6 +216,8 @@ kx_int32_t find_subacl_view(const sec_buffer_s &acl, unsigned char type, const c
             *found = true;
             return SEC_S_OK;
         }
+        if (i + 1 < count && !subacl_length_covers_header(*v))
+            return report_corrupt(here(src_acl));
         offset = v->end();
     }
     return SEC_S_OK;

@@ -104,6 +104,11 @@ struct subacl_view {
 // Reads the sub-ACL header at offset; false when it does not fit in b.
 bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v);
 
+// A sub-ACL length that covers the sub-ACL's own header and mechanism: a
+// shorter one leads the walk to the same bytes again (a length of 0 to the
+// same sub-ACL, as many times as the count says), so no sub-ACL can follow.
+bool subacl_length_covers_header(const subacl_view &v);
+
 // The bytes that the records of sub-ACL v may lie in when all the sub-ACLs
 // are walked: up to where the next one starts, and for the last one up to
 // the buffer's end (validation bounds only the others). Overlapping

@@ -91,12 +91,6 @@ void report_acle_line(const sec_acle_t acle, const char *mech, const char *id, c
         report<MSG_DUMP_ACLE>(dump_line, leadspace, letter, perms);
 }
 
-// The number of a sub-ACL's header and mechanism bytes: stepping to the next
-// sub-ACL by a shorter length would read this one's bytes again as a header.
-bool subacl_length_covers_header(const subacl_view &v) {
-    return v.length >= v.first_entry - v.offset;
-}
-
 } // namespace
 
 void sec__dump_acle(sec_acle_t acle, sec_perm_set_t ptplset, const char *leadspace) {

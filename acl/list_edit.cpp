@@ -38,6 +38,8 @@ kx_int32_t append_subacls(const sec_buffer_s &acl, sec_acle_list_t list, Wanted 
             if (rc != SEC_S_OK)
                 return rc;
         }
+        if (i + 1 < count && !subacl_length_covers_header(v))
+            return report_corrupt(here(src_acl));
         offset = v.end();
     }
     return SEC_S_OK;

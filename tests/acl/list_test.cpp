@@ -54,6 +54,22 @@ TEST(ListAcl, RecordsOfASubaclEndWhereTheNextStarts) {
         expect_error(SEC_S_BAD_ACL, MSG_2650_110);
         EXPECT_EQ(list.l.count, 0);
     }
+    // Nor can a sub-ACL too short for its own header lead on to another:
+    // listing and evaluation stop at the first such, rather than walking
+    // the same bytes as many times as the count says.
+    bytes zero_lengths = make_acl({make_subacl(2, 0, {}, {})});
+    kxacl::store_u32(&zero_lengths[5], 0);
+    kxacl::store_u16(&zero_lengths[3], 0xffff);
+    owned_acl acl(zero_lengths);
+    owned_list list;
+    EXPECT_EQ(sec_list_acl(acl.get(), list.get()), SEC_S_BAD_ACL);
+    expect_error(SEC_S_BAD_ACL, MSG_2650_110);
+    kx_uint32_t perm = 0;
+    EXPECT_EQ(sec__single_acle_perm(acl.get(), SEC_ACLE_UNAUTHENTICATED, nullptr, nullptr, nullptr,
+                                    &perm),
+              SEC_S_BAD_ACL);
+    expect_error(SEC_S_BAD_ACL, MSG_2650_110);
+
     // The last sub-ACL's records may run past its length, as validation allows.
     bytes last_long = make_acl({make_subacl(2, 1, {}, {make_record(1)}),
                                 make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, -7)});
