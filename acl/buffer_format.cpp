@@ -57,20 +57,6 @@ bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v) {
     return true;
 }
 
-bool read_acle(acl_bytes b, std::size_t offset, acle_view *v) {
-    if (offset > b.size || b.size - offset < layout::acle_header_size)
-        return false;
-    const unsigned char *p = b.data + offset;
-    v->version = p[layout::at_acle_version];
-    v->perm = load_u32(p + layout::at_perm);
-    v->id_length = load_u16(p + layout::at_id_length);
-    if (b.size - offset - layout::acle_header_size < v->id_length)
-        return false;
-    v->id = v->id_length ? reinterpret_cast<const char *>(p + layout::at_id) : nullptr;
-    v->next = offset + layout::acle_header_size + v->id_length;
-    return true;
-}
-
 bool acle_view::id_well_formed() const {
     // Bounded: a field without NUL may end the buffer.
     return id_length > 0 && strnlen(id, id_length) + 1 == id_length;
