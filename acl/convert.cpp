@@ -28,32 +28,27 @@ kx_int32_t subacl_mech(const subacl_view &v, const char **mech) {
     return SEC_S_OK;
 }
 
-// Adds the entry of one record to the tree.
+// Adds the entry of one record to the tree, which copies it: the record's
+// identifier is used where it stands in the buffer.
 kx_int32_t add_record(const subacl_view &v, const char *mech, const acle_view &e,
                       sec_acltree_t *tree) {
-    const char *id = nullptr;
+    sec_acle_desc entry{};
+    entry.perm = e.perm;
+    entry.type = v.type;
+    std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
     if (type_has_id(v.type)) {
         // The identifier must end within its record to be read as a text.
         if (!e.id_terminated())
             return report_corrupt(here(src_acl));
-        id = e.id;
+        entry.id = const_cast<char *>(e.id);
     }
-    sec_acle_t entry = nullptr;
-    kx_int32_t rc = sec__create_acle(v.type, e.perm, mech, id, 0, &entry);
-    if (rc != SEC_S_OK)
-        return rc;
-    unique_acle owned(entry);
-    return sec__add_acle_to_tree(0, entry, tree);
+    return sec__add_acle_to_tree(0, &entry, tree);
 }
 
 std::size_t subacl_header_length(sec_acltree_t tree) {
     return type_has_mech(tree->sat_type)
                ? layout::subacl_header_size + std::strlen(tree->sat_mech) + 1
                : layout::subacl_header_size;
-}
-
-std::size_t record_length(const sec_acle_t acle) {
-    return layout::acle_header_size + (type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0);
 }
 
 // The size of the tree's sub-ACL, 0 when it holds no entry. An identifier
@@ -63,8 +58,8 @@ kx_int32_t subacl_length(sec_acltree_t tree, std::size_t *length) {
     *length = 0;
     std::size_t total = 0;
     kx_int32_t rc = walk_acltree(tree, [&](sec_acltree_node_s *n) {
-        std::size_t record = record_length(n->sat_acle);
-        if (record - layout::acle_header_size > layout::max_id_length)
+        std::size_t record = layout::acle_header_size + n->sat_id_size;
+        if (n->sat_id_size > layout::max_id_length)
             return report<MSG_2650_117>(SEC_S_BAD_ACLE, n->sat_acle->type);
         total += record;
         if (total > layout::max_buffer_length)
@@ -90,7 +85,7 @@ std::size_t write_subacl(sec_acltree_t tree, unsigned char *out) {
     walk_acltree(tree, [&](sec_acltree_node_s *n) {
         const sec_acle_t acle = n->sat_acle;
         unsigned char *record = out + offset;
-        std::size_t id_length = type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0;
+        std::size_t id_length = n->sat_id_size;
         record[layout::at_acle_version] = layout::acle_version;
         store_u32(record + layout::at_perm, acle->perm);
         store_u16(record + layout::at_id_length, static_cast<std::uint16_t>(id_length));

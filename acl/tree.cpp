@@ -7,6 +7,7 @@
 #include <kx_cu.h>
 
 #include "alloc.h"
+#include "cu/posix_case.h"
 #include "entries.h"
 #include "frame.h"
 #include "report.h"
@@ -15,7 +16,19 @@ namespace kxacl {
 
 namespace {
 
+namespace posix_case = kx::posix_case;
 using node = sec_acltree_node_s;
+using node_block = sec_acltree_block_s;
+
+// Deeper than any balanced tree can grow: one of height 64 would need more
+// than 10^13 nodes.
+constexpr int max_height = 64;
+
+// Nodes per block: the first block is small, for the many trees of one or a
+// few entries that editing makes; each next one doubles, up to a size that
+// keeps the block's waste small next to a large tree.
+constexpr std::uint32_t first_block_nodes = 8;
+constexpr std::uint32_t largest_block_nodes = 4096;
 
 int height(const node *n) {
     return n ? n->sat_height : 0;
@@ -59,45 +72,77 @@ node *rebalance(node *n) {
     return n;
 }
 
-// Links a fresh node whose identity is not in the subtree; the depth of the
-// recursion is the height of a balanced tree.
-node *link_node(node *n, node *fresh) {
-    if (!n)
-        return fresh;
-    if (cu_strcasecmp_posix_1(fresh->sat_acle->id, n->sat_acle->id) < 0)
-        n->sat_left = link_node(n->sat_left, fresh);
-    else
-        n->sat_right = link_node(n->sat_right, fresh);
-    return rebalance(n);
+// The identity of an entry being looked up, measured once.
+struct probe {
+    const char *id;
+    std::uint32_t size; // with the NUL; 0 without identifier
+    std::uint64_t key;
+
+    explicit probe(const sec_acle_t acle) {
+        id = type_has_id(acle->type) ? (acle->id ? acle->id : "") : nullptr;
+        size = id ? static_cast<std::uint32_t>(std::strlen(id) + 1) : 0;
+        key = id ? posix_case::sort_key(id, size) : 0;
+    }
+};
+
+// Orders the probe against a node that holds an identifier, as
+// cu_strcasecmp_posix_1 orders their identifiers. Equal keys of a text that
+// ends within them are equal texts; otherwise both go on past the key.
+int order(const probe &p, const node *n) {
+    if (p.key != n->sat_key)
+        return p.key < n->sat_key ? -1 : 1;
+    if (p.size <= 8)
+        return 0;
+    return posix_case::compare(p.id + 8, p.size - 8, n->sat_acle->id + 8, n->sat_id_size - 8);
 }
 
-// Outcome of looking an identity up.
+// Where a walk down the tree for an identity ended.
 enum class lookup { absent, found, unusable };
+struct search {
+    lookup outcome = lookup::absent;
+    node **slot = nullptr; // the node found, or the empty slot for the identity
+    node **path[max_height];
+    int depth = 0; // slots passed above *slot, the root's first
+};
 
-// Finds the node of acle's identity: the single node of an unauthenticated or
-// anyother tree, else the node whose identifier equals acle's ignoring case.
-lookup find_node(sec_acltree_t tree, const sec_acle_t acle, node **found) {
-    *found = nullptr;
-    if (!tree || !tree->sat_root)
-        return lookup::absent;
-    if (!type_has_id(acle->type)) {
-        *found = tree->sat_root;
-        return lookup::found;
+// Walks down from the root to the node of the probe's identity, or to the
+// empty slot where it belongs, noting the slots passed for rebalancing.
+// Trees without identities hold one node, which is every entry's.
+void find(sec_acltree_t tree, const probe &p, search *s) {
+    s->slot = &tree->sat_root;
+    if (!p.id) {
+        s->outcome = *s->slot ? lookup::found : lookup::absent;
+        return;
     }
-    const char *id = acle->id ? acle->id : "";
-    for (node *n = tree->sat_root; n;) {
+    while (node *n = *s->slot) {
         // Deleted nodes carry no identity to steer by; callers write or free
         // a tree right after a deletion, so meeting one here is a misuse.
-        if (!n->sat_acle || !n->sat_acle->id)
-            return lookup::unusable;
-        int c = cu_strcasecmp_posix_1(id, n->sat_acle->id);
-        if (c == 0) {
-            *found = n;
-            return lookup::found;
+        if (!n->sat_acle || !n->sat_acle->id || s->depth == max_height) {
+            s->outcome = lookup::unusable;
+            return;
         }
-        n = c < 0 ? n->sat_left : n->sat_right;
+        int c = order(p, n);
+        if (c == 0) {
+            s->outcome = lookup::found;
+            return;
+        }
+        s->path[s->depth++] = s->slot;
+        s->slot = c < 0 ? &n->sat_left : &n->sat_right;
     }
-    return lookup::absent;
+    s->outcome = lookup::absent;
+}
+
+// Restores the balance above a node just linked, from the lowest slot up;
+// once a subtree has its old height again, nothing above it changes.
+void rebalance_path(search &s) {
+    for (int i = s.depth - 1; i >= 0; --i) {
+        node *n = *s.path[i];
+        int before = n->sat_height;
+        n = rebalance(n);
+        *s.path[i] = n;
+        if (n->sat_height == before)
+            break;
+    }
 }
 
 const char *type_word(unsigned type) {
@@ -136,27 +181,40 @@ kx_int32_t merge_duplicate(sec_boolean_t single, const sec_acle_t acle, node *ex
     return SEC_S_OK;
 }
 
-// A node holding a deep copy of acle.
-kx_int32_t make_node(const sec_acle_t acle, node **out) {
-    unique_mem<node> fresh(static_cast<node *>(mem_zalloc(sizeof(node))));
+// Makes sure that the tree's last block has room for one more node.
+kx_int32_t reserve_node(sec_acltree_t tree) {
+    node_block *last = tree->sat_last_block;
+    if (last && last->used < last->capacity)
+        return SEC_S_OK;
+    std::uint32_t capacity =
+        last ? std::min(2 * last->capacity, largest_block_nodes) : first_block_nodes;
+    std::size_t bytes = sizeof(node_block) + capacity * sizeof(node);
+    auto *fresh = static_cast<node_block *>(mem_alloc(bytes));
     if (!fresh)
-        return no_memory("sec__add_acle_to_tree", sizeof(node));
-    unique_acle copy(static_cast<sec_acle_t>(mem_zalloc(sizeof(sec_acle_desc))));
+        return no_memory("sec__add_acle_to_tree", bytes);
+    *fresh = node_block{nullptr, 0, capacity};
+    if (last)
+        last->next = fresh;
+    else
+        tree->sat_blocks = fresh;
+    tree->sat_last_block = fresh;
+    return SEC_S_OK;
+}
+
+// Takes the reserved node and gives it a copy of acle.
+kx_int32_t make_node(sec_acltree_t tree, const sec_acle_t acle, const probe &p, node **out) {
+    kx_int32_t rc = reserve_node(tree);
+    if (rc != SEC_S_OK)
+        return rc;
+    sec_acle_t copy = copy_acle_in_one_block(*acle, p.id, p.size);
     if (!copy)
-        return no_memory("sec__add_acle_to_tree", sizeof(sec_acle_desc));
-    copy->perm = acle->perm;
-    copy->type = acle->type;
-    if (type_has_mech(acle->type))
-        std::memcpy(copy->mech, acle->mech, SEC_MECH_MAX);
-    if (type_has_id(acle->type) && acle->id) {
-        std::size_t length = std::strlen(acle->id);
-        copy->id = mem_strndup(acle->id, length);
-        if (!copy->id)
-            return no_memory("sec__add_acle_to_tree", length + 1);
-    }
-    fresh->sat_acle = copy.release();
-    fresh->sat_height = 1;
-    *out = fresh.release();
+        return no_memory("sec__add_acle_to_tree", one_block_size(p.size));
+    if (!type_has_mech(acle->type))
+        std::memset(copy->mech, 0, sizeof copy->mech);
+    node_block *block = tree->sat_last_block;
+    node *n = &block->nodes()[block->used++];
+    *n = node{copy, nullptr, nullptr, p.key, p.size, 1};
+    *out = n;
     return SEC_S_OK;
 }
 
@@ -182,15 +240,6 @@ bool tree_has_key(sec_acltree_t tree, const sec_acle_t acle) {
 } // namespace
 
 kx_int32_t sec__add_acle_to_tree(sec_boolean_t single, const sec_acle_t acle, sec_acltree_t *tree) {
-    node *existing = nullptr;
-    switch (find_node(*tree, acle, &existing)) {
-    case lookup::found:
-        return merge_duplicate(single, acle, existing);
-    case lookup::unusable:
-        return internal_error(here(src_acl), 0);
-    case lookup::absent:
-        break;
-    }
     bool made_tree = false;
     if (!*tree) {
         kx_int32_t rc = make_tree(acle, tree);
@@ -198,22 +247,30 @@ kx_int32_t sec__add_acle_to_tree(sec_boolean_t single, const sec_acle_t acle, se
             return rc;
         made_tree = true;
     }
+    probe p(acle);
+    search s;
+    find(*tree, p, &s);
+    switch (s.outcome) {
+    case lookup::found:
+        if ((*s.slot)->sat_acle)
+            return merge_duplicate(single, acle, *s.slot);
+        [[fallthrough]];
+    case lookup::unusable:
+        return internal_error(here(src_acl), 0);
+    case lookup::absent:
+        break;
+    }
     node *fresh = nullptr;
-    kx_int32_t rc = make_node(acle, &fresh);
+    kx_int32_t rc = make_node(*tree, acle, p, &fresh);
     if (rc != SEC_S_OK) {
         if (made_tree) {
-            std::free(*tree);
+            sec__free_acltree(*tree);
             *tree = nullptr;
         }
         return rc;
     }
-    sec_acltree_t t = *tree;
-    t->sat_root = link_node(t->sat_root, fresh);
-    if (t->sat_last)
-        t->sat_last->sat_next = fresh;
-    else
-        t->sat_first = fresh;
-    t->sat_last = fresh;
+    *s.slot = fresh;
+    rebalance_path(s);
     return SEC_S_OK;
 }
 
@@ -232,12 +289,17 @@ kx_int32_t sec__add_acle_to_trees(const sec_acle_t acle, sec_acltree_t **trees, 
 }
 
 kx_int32_t sec__del_acle_from_tree(const sec_acle_t acle, sec_acltree_t tree) {
-    node *found = nullptr;
-    if (find_node(tree, acle, &found) != lookup::found || !found->sat_acle) {
+    search s;
+    if (tree) {
+        probe p(acle);
+        find(tree, p, &s);
+    }
+    if (s.outcome != lookup::found || !(*s.slot)->sat_acle) {
         const char *mech = type_has_mech(acle->type) ? acle->mech : "";
         const char *id = type_has_id(acle->type) && acle->id ? acle->id : "";
         return report<MSG_2650_118>(SEC_S_ACLE_NOT_FOUND, acle->type, mech, id);
     }
+    node *found = *s.slot;
     release_acle(found->sat_acle);
     found->sat_acle = nullptr;
     return SEC_S_OK;
@@ -246,12 +308,13 @@ kx_int32_t sec__del_acle_from_tree(const sec_acle_t acle, sec_acltree_t tree) {
 void sec__free_acltree(sec_acltree_t tree) {
     if (!tree)
         return;
-    // Every node is on the insertion list, so freeing needs no recursion.
-    for (node *n = tree->sat_first; n;) {
-        node *next = n->sat_next;
-        release_acle(n->sat_acle);
-        std::free(n);
-        n = next;
+    // Every node is in a block, so freeing needs no walk of the tree.
+    for (node_block *b = tree->sat_blocks; b;) {
+        node_block *next = b->next;
+        for (std::uint32_t i = 0; i < b->used; ++i)
+            release_acle(b->nodes()[i].sat_acle);
+        std::free(b);
+        b = next;
     }
     std::free(tree);
 }
@@ -262,20 +325,22 @@ void free_acltrees(sec_acltree_t *trees, int count) {
     std::free(trees);
 }
 
-bool tree_has_entry(sec_acltree_t tree) {
-    if (tree)
-        for (node *n = tree->sat_first; n; n = n->sat_next)
-            if (n->sat_acle)
-                return true;
-    return false;
-}
-
 std::size_t tree_entry_count(sec_acltree_t tree) {
     std::size_t count = 0;
     if (tree)
-        for (node *n = tree->sat_first; n; n = n->sat_next)
-            count += n->sat_acle != nullptr;
+        for (node_block *b = tree->sat_blocks; b; b = b->next)
+            for (std::uint32_t i = 0; i < b->used; ++i)
+                count += b->nodes()[i].sat_acle != nullptr;
     return count;
+}
+
+bool tree_has_entry(sec_acltree_t tree) {
+    if (tree)
+        for (node_block *b = tree->sat_blocks; b; b = b->next)
+            for (std::uint32_t i = 0; i < b->used; ++i)
+                if (b->nodes()[i].sat_acle)
+                    return true;
+    return false;
 }
 
 } // namespace kxacl

@@ -3,14 +3,21 @@
 //
 // A tree keeps its nodes twice: in a height-balanced search tree ordered by
 // identity (case-insensitive in the POSIX locale), where duplicates are
-// found in O(log n) whatever the order of insertion, and in a list in
-// insertion order. User and group entries are written in identity order,
-// expanded entries in insertion order. Balance keeps every walk's depth near
-// log2 n, so recursion over the search tree is bounded.
+// found in O(log n) whatever the order of insertion, and in insertion order,
+// as the node blocks hand them out. User and group entries are written in
+// identity order, expanded entries in insertion order. Balance keeps every
+// walk's depth near log2 n, so recursion over the search tree is bounded.
+//
+// Compiling a large ACL file makes one node per line, so a node costs at
+// most one allocation: nodes come from blocks of growing size that the tree
+// owns, and each entry is one block with its identifier behind it. Every
+// node carries the first eight folded bytes of its identifier as a number,
+// which decides most comparisons without reaching the identifier itself.
 #ifndef KXACL_TREE_H
 #define KXACL_TREE_H
 
 #include <cstddef>
+#include <cstdint>
 
 #include <kx_acl.h>
 
@@ -21,16 +28,25 @@ struct sec_acltree_node_s {
     sec_acle_t sat_acle;
     sec_acltree_node_s *sat_left;
     sec_acltree_node_s *sat_right;
-    sec_acltree_node_s *sat_next; // insertion order
+    std::uint64_t sat_key;     // the identifier's sort key (cu/posix_case.h)
+    std::uint32_t sat_id_size; // the identifier's length with its NUL; 0 without one
     int sat_height;
+};
+
+// A block of nodes, handed out in insertion order. The nodes follow it.
+struct sec_acltree_block_s {
+    sec_acltree_block_s *next;
+    std::uint32_t used;
+    std::uint32_t capacity;
+    sec_acltree_node_s *nodes() { return reinterpret_cast<sec_acltree_node_s *>(this + 1); }
 };
 
 // A tree of one sub-ACL key. The key is that of its first entry, whose
 // mechanism spelling the sub-ACL keeps. A null sec_acltree_t is the empty tree.
 typedef struct sec_acltree_s {
     sec_acltree_node_s *sat_root;
-    sec_acltree_node_s *sat_first; // first inserted
-    sec_acltree_node_s *sat_last;  // last inserted
+    sec_acltree_block_s *sat_blocks;     // the first block
+    sec_acltree_block_s *sat_last_block; // the one new nodes come from
     unsigned char sat_type;
     char sat_mech[SEC_MECH_MAX + 1];
 } sec_acltree_desc, *sec_acltree_t;
@@ -82,13 +98,15 @@ template <typename Visit> kx_int32_t walk_acltree(sec_acltree_t tree, Visit &&vi
         return SEC_S_OK;
     if (tree->sat_type == SEC_ACLE_USER || tree->sat_type == SEC_ACLE_GROUP)
         return detail::walk_in_order(tree->sat_root, visit);
-    for (sec_acltree_node_s *n = tree->sat_first; n; n = n->sat_next) {
-        if (!n->sat_acle)
-            continue;
-        kx_int32_t rc = visit(n);
-        if (rc != SEC_S_OK)
-            return rc;
-    }
+    for (sec_acltree_block_s *b = tree->sat_blocks; b; b = b->next)
+        for (std::uint32_t i = 0; i < b->used; ++i) {
+            sec_acltree_node_s *n = &b->nodes()[i];
+            if (!n->sat_acle)
+                continue;
+            kx_int32_t rc = visit(n);
+            if (rc != SEC_S_OK)
+                return rc;
+        }
     return SEC_S_OK;
 }
 

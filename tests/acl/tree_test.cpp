@@ -45,6 +45,24 @@ TEST(Acltree, UserAndGroupByIdentityExpandedAsAdded) {
     EXPECT_EQ(expanded.walked(), (texts{"z/3", "a/3", "m/3"}));
 }
 
+// Nodes order by the first eight folded bytes and only then by the rest:
+// identities that share those bytes, or end within them, still order and
+// collide exactly as the comparison says.
+TEST(Acltree, IdentitiesSharingTheirFirstEightBytes) {
+    owned_tree user;
+    for (const char *id : {"prefix-of-Tail-b", "prefix-o", "PREFIX-OF-TAIL", "prefix-of-tail-A",
+                           "prefix-", "prefix-of-tail-a-x", "prefix-of"})
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK) << id;
+    EXPECT_EQ(user.walked(),
+              (texts{"prefix-/1", "prefix-o/1", "prefix-of/1", "PREFIX-OF-TAIL/1",
+                     "prefix-of-tail-A/1", "prefix-of-tail-a-x/1", "prefix-of-Tail-b/1"}));
+    for (const char *id : {"Prefix-Of-Tail-B", "PREFIX-O", "prefix-OF"})
+        EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 2, "unix", id}), SEC_S_BAD_ACLE) << id;
+    entry gone{SEC_ACLE_USER, 0, "unix", "PREFIX-OF-TAIL-a"};
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
+    EXPECT_EQ(user.walked().size(), 6u);
+}
+
 TEST(Acltree, DuplicatesRefusedOrMerged) {
     owned_tree user, group, anyother;
     ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "Alice"}), SEC_S_OK);
@@ -104,13 +122,18 @@ TEST(Acltree, SortedInsertionOfManyIdentities) {
 }
 
 TEST(AllocationFailure, AddAcleToTrees) {
-    // Into an existing tree, and as a new key that grows the array.
-    for (entry added :
-         {entry{SEC_ACLE_USER, 1, "unix", "carol"}, entry{SEC_ACLE_GROUP, 1, "", "x"}}) {
-        EXPECT_GE(for_each_allocation_failure([&](long n) {
+    // Into an existing tree, whose node block has room: the entry with its
+    // identifier is the one allocation. As a new key: the array grows, and
+    // the tree, its first node block and the entry are made.
+    struct {
+        entry added;
+        long allocations;
+    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 1}, {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
+    for (const auto &c : cases) {
+        EXPECT_EQ(for_each_allocation_failure([&](long n) {
                       owned_trees trees;
                       EXPECT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
-                      kx_int32_t rc = failing_after(n, [&] { return trees.add(added); });
+                      kx_int32_t rc = failing_after(n, [&] { return trees.add(c.added); });
                       if (rc != SEC_S_OK) {
                           expect_no_memory(rc, {"sec__add_acle_to_trees", "sec__add_acle_to_tree"});
                           std::size_t entries = 0;
@@ -120,7 +143,7 @@ TEST(AllocationFailure, AddAcleToTrees) {
                       }
                       return rc;
                   }),
-                  3);
+                  c.allocations);
     }
 }
 
