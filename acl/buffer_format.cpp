@@ -8,6 +8,7 @@
 
 #include "alloc.h"
 #include "byteorder.h"
+#include "cu/posix_case.h"
 #include "entries.h"
 #include "report.h"
 
@@ -69,7 +70,7 @@ bool acle_view::id_terminated() const {
 bool subacl_mech_equals(const subacl_view &v, const char *mech) {
     // The stored NUL must lie within the field, so the comparison ends there.
     return v.mech && std::memchr(v.mech, '\0', v.mech_length) &&
-           cu_strncasecmp_posix_1(mech, v.mech, v.mech_length) == 0;
+           kx::posix_case::compare(mech, std::strlen(mech) + 1, v.mech, v.mech_length) == 0;
 }
 
 bool new_empty_buffer(sec_buffer_s *acl) {

@@ -179,6 +179,19 @@ void evaluation_throughput(benchmark::State &state) {
     state.SetItemsProcessed(state.iterations());
 }
 
+// The same, as the baseline scan: what two threads of this machine give
+// for work that shares nothing.
+void scan_throughput_baseline(benchmark::State &state) {
+    entry_set &set = users(1000);
+    std::string id = capitalised(set.ids[set.ids.size() / 2]);
+    for (auto _ : state) {
+        bool matched = false;
+        benchmark::DoNotOptimize(scan(set.array.data(), set.array.size(), id.c_str(), &matched));
+        benchmark::DoNotOptimize(matched);
+    }
+    state.SetItemsProcessed(state.iterations());
+}
+
 bool registered = [] {
     for (std::size_t n : {10, 1000, 100000})
         for (where w : {where::first, where::last, where::none}) {
@@ -195,6 +208,11 @@ bool registered = [] {
                                      group_scan_baseline, k);
     }
     benchmark::RegisterBenchmark("evaluation_throughput/n:1000", evaluation_throughput)
+        ->Threads(1)
+        ->Threads(2)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("evaluation_throughput.baseline/n:1000",
+                                 scan_throughput_baseline)
         ->Threads(1)
         ->Threads(2)
         ->UseRealTime();

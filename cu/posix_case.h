@@ -93,10 +93,16 @@ inline int compare(const char *a, std::size_t a_avail, const char *b,
 // that differ order two texts as compare() does, and equal keys of a text
 // that ends within them mean equal texts.
 inline std::uint64_t sort_key(const char *text, std::size_t size) noexcept {
-    char head[8] = {};
-    std::memcpy(head, text, size < 8 ? size : 8);
-    // load8 puts the first byte lowest; in a key it must weigh most.
-    return __builtin_bswap64(detail::fold8(detail::load8(head)));
+    // The first byte lowest, as load8 gives it; a shorter text is put
+    // together byte by byte, so that nothing past its end is read.
+    std::uint64_t head = 0;
+    if (size >= 8)
+        head = detail::load8(text);
+    else
+        for (std::size_t i = 0; i < size; ++i)
+            head |= std::uint64_t{static_cast<unsigned char>(text[i])} << (8 * i);
+    // In a key the first byte must weigh most.
+    return __builtin_bswap64(detail::fold8(head));
 }
 
 // A text folded once to be ordered against many others, as evaluation does

@@ -3,7 +3,7 @@
 # when they are all present; uses sudo when not run as root.
 set -euo pipefail
 packages=(build-essential cmake g++ clang libclang-rt-14-dev libgtest-dev libgmock-dev
-          libbenchmark-dev locales valgrind cppcheck clang-tidy clang-format gettext-base)
+          libbenchmark-dev locales valgrind cppcheck clang-tidy clang-format gettext-base python3)
 missing=()
 for p in "${packages[@]}"; do
   dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'install ok installed' || missing+=("$p")
