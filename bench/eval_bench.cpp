@@ -211,8 +211,7 @@ bool registered = [] {
         ->Threads(1)
         ->Threads(2)
         ->UseRealTime();
-    benchmark::RegisterBenchmark("evaluation_throughput.baseline/n:1000",
-                                 scan_throughput_baseline)
+    benchmark::RegisterBenchmark("evaluation_throughput.baseline/n:1000", scan_throughput_baseline)
         ->Threads(1)
         ->Threads(2)
         ->UseRealTime();

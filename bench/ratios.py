@@ -58,11 +58,11 @@ def main():
         return get(f"read_acl_file_compile/lines:{lines}/{order}/process_time/real_time")
 
     for lines in ("10000", "100000", "1000000"):
-        r = compile_time(lines, "sorted")["real_time"] / compile_time(lines, "shuffled")["real_time"]
+        r = compile_time(lines, "sorted")["cpu_time"] / compile_time(lines, "shuffled")["cpu_time"]
         row(f"compile {int(lines):,} lines: sorted / shuffled", r, "≤ 1.5", r <= 1.5)
     for order in ("shuffled", "sorted"):
         for small, large in (("10000", "100000"), ("100000", "1000000")):
-            r = compile_time(large, order)["real_time"] / compile_time(small, order)["real_time"]
+            r = compile_time(large, order)["cpu_time"] / compile_time(small, order)["cpu_time"]
             row(f"compile {order}: {int(large):,} / {int(small):,} lines", r, "≤ 12", r <= 12)
     allocs = max(compile_time(l, o)["allocs_per_line"]
                  for l in ("10000", "100000", "1000000") for o in ("shuffled", "sorted"))
@@ -77,15 +77,24 @@ def main():
         r = cpu("read_acl_file_cached" + args) / cpu("read_acl_file_cached.baseline" + args)
         row(f"cached read, {n} entries / bare open+fstat+read+close", r, "≤ 1.5", r <= 1.5)
 
-    def throughput(name, threads):
-        return get(f"{name}/n:1000/real_time/threads:{threads}")["items_per_second"]
+    def threaded(name, threads):
+        return get(f"{name}/n:1000/real_time/threads:{threads}")
 
     for name, label in (("evaluation_throughput", "evaluation"),
                         ("evaluation_throughput.baseline", "baseline scan")):
-        r = throughput(name, 2) / throughput(name, 1)
-        target = "≥ 1.8" if label == "evaluation" else "(the machine's own)"
-        row(f"{label} throughput, 2 threads / 1 thread", r, target,
-            r >= 1.8 if label == "evaluation" else True)
+        one, two = threaded(name, 1), threaded(name, 2)
+        r = two["items_per_second"] / one["items_per_second"]
+        if label == "evaluation":
+            row(f"{label} throughput, 2 threads / 1 thread (wall time)", r, "≥ 1.8", r >= 1.8)
+        else:
+            rows.append((f"{label} throughput, 2 threads / 1 thread (wall time)", f"{r:.2f}",
+                         "what the machine gave", "-"))
+        # Contention (shared cache lines, locks) would make each evaluation
+        # cost more CPU time with two threads; two free cores then give
+        # 2 × (CPU per evaluation alone) / (CPU per evaluation with two).
+        c = 2 * one["cpu_time"] / two["cpu_time"]
+        rows.append((f"{label}: 2 × CPU per item with 1 thread / with 2 threads", f"{c:.2f}",
+                     "≥ 1.8 (what two free cores give)", "yes" if c >= 1.8 else "**no**"))
 
     evaluations = [b for name, b in runs.items()
                    if name.startswith(("single_acle_perm/", "group_acles_perm/",
