@@ -134,8 +134,9 @@ inline bool read_acle(acl_bytes b, std::size_t offset, acle_view *v) {
     return true;
 }
 
-// The mechanism of a user or expanded sub-ACL equals mech, ignoring case.
-bool subacl_mech_equals(const subacl_view &v, const char *mech);
+// The mechanism of a user or expanded sub-ACL equals mech (of mech_size
+// bytes, its NUL included), ignoring case.
+bool subacl_mech_equals(const subacl_view &v, const char *mech, std::size_t mech_size);
 
 // Validates the structure of a buffer whose header has been accepted and
 // which is in host byte order; reports the first fault found.
