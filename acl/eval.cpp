@@ -173,6 +173,29 @@ posix_case::prepared_text prepared(const char *text) {
     return posix_case::prepared_text(text, std::strlen(text) + 1);
 }
 
+// One step of a walk of user or group entries, which stand in ascending
+// order, by the order r of the requester against the entry: equal, the
+// entry's mask is ORed into *mask; sorting after it, the walk goes on.
+walk ordered_step(int r, const entry_ref &e, kx_uint32_t *mask, bool *matched) {
+    if (r == 0) {
+        *mask |= e.perm();
+        *matched = true;
+    }
+    return r > 0 ? walk::next : walk::stop;
+}
+
+// The walk of user or group entries for a requester compared as text: the
+// loop that evaluation spends its time in. A function of its own, so that
+// the walk's pointer and the folded requester stay in registers whatever
+// the code around it.
+[[gnu::noinline]] kx_int32_t ordered_walk(acl_bytes b, const subacl_view &v, const char *requester,
+                                          kx_uint32_t *mask, bool *matched) {
+    const posix_case::prepared_text wanted = prepared(requester);
+    return walk_entries(b, v, [&](const entry_ref &e) {
+        return ordered_step(wanted.order(e.id, e.readable), e, mask, matched);
+    });
+}
+
 // Asks a handler about one entry. A handler may leave a record about a
 // mismatch; it must not outlive the mismatch.
 kx_int32_t ask_handler(sec_acl_id_handler handler, char *id, const entry_ref &e) {
@@ -236,16 +259,13 @@ kx_int32_t user_perm(acl_bytes b, const subacl_view &v, unsigned char type, char
     // A failed lookup counts as no handler: the comparison falls back.
     if (type & SEC_ACLE_HANDLER_BIT)
         (void)sec__get_id_handler(SEC_ID_HANDLER_USER, mech, &handler);
-    posix_case::prepared_text wanted = prepared(id);
     bool matched = false;
-    kx_int32_t rc = walk_entries(b, v, [&](const entry_ref &e) {
-        kx_int32_t r = handler ? ask_handler(handler, id, e) : wanted.order(e.id, e.readable);
-        if (r == 0) {
-            *perm = e.perm();
-            matched = true;
-        }
-        return r > 0 ? walk::next : walk::stop;
-    });
+    kx_int32_t rc = handler ? walk_entries(b, v,
+                                           [&](const entry_ref &e) {
+                                               return ordered_step(ask_handler(handler, id, e), e,
+                                                                   perm, &matched);
+                                           })
+                            : ordered_walk(b, v, id, perm, &matched);
     if (rc != SEC_S_OK || matched)
         return rc;
     return no_entry(type, mech, id);
@@ -341,15 +361,7 @@ kx_int32_t group_acles_perm(sec_acl_buffer_t acl, kx_int32_t count, sec_buffer_t
         // so that the caller's other groups still count.
         if (!name)
             continue;
-        posix_case::prepared_text wanted = prepared(name);
-        rc = walk_entries(b, v, [&](const entry_ref &e) {
-            int r = wanted.order(e.id, e.readable);
-            if (r == 0) {
-                mask |= e.perm();
-                matched = true;
-            }
-            return r > 0 ? walk::next : walk::stop;
-        });
+        rc = ordered_walk(b, v, name, &mask, &matched);
         if (rc != SEC_S_OK)
             return rc;
     }

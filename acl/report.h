@@ -82,8 +82,10 @@ template <typename T> cu_error_arg_t record_arg(T v) {
 // The kinds of the arguments are known here, so the record is handed over
 // whole (cu_pset_error_1 copies it) rather than cu_set_error_1 reading them
 // from the message text again: refusing a request sets a record, and that
-// is on the request path.
-template <msg Index, typename... Args> kx_int32_t report(kx_int32_t status, Args... args) {
+// is on the request path. Kept out of line: the hot loops of its callers
+// keep their registers.
+template <msg Index, typename... Args>
+[[gnu::noinline, gnu::cold]] kx_int32_t report(kx_int32_t status, Args... args) {
     static_assert(placeholder_count(message_text(Index)) == sizeof...(Args),
                   "argument count differs from the message's placeholders");
     static_assert(detail::kinds_match<Index, Args...>(std::index_sequence_for<Args...>{}),
