@@ -185,8 +185,13 @@ kx_int32_t sec__acltree_to_aclelist(sec_acltree_t tree, sec_acle_list_t aclelist
     if (!grown)
         return no_memory("sec__acltree_to_aclelist", bytes);
     aclelist->acles = grown;
+    // The entries live in the tree's blocks: each goes to the list as an
+    // entry of its own, in one block with its identifier.
     return walk_acltree(tree, [&](sec_acltree_node_s *n) {
-        grown[aclelist->count++] = n->sat_acle;
+        sec_acle_t copy = copy_acle_in_one_block(*n->sat_acle, n->sat_acle->id, n->sat_id_size);
+        if (!copy)
+            return no_memory("sec__acltree_to_aclelist", one_block_size(n->sat_id_size));
+        grown[aclelist->count++] = copy;
         n->sat_acle = nullptr;
         return SEC_S_OK;
     });

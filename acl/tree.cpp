@@ -19,6 +19,7 @@ namespace {
 namespace posix_case = kx::posix_case;
 using node = sec_acltree_node_s;
 using node_block = sec_acltree_block_s;
+using tree_text = sec_acltree_text_s;
 
 // Deeper than any balanced tree can grow: one of height 64 would need more
 // than 10^13 nodes.
@@ -29,6 +30,10 @@ constexpr int max_height = 64;
 // keeps the block's waste small next to a large tree.
 constexpr std::uint32_t first_block_nodes = 8;
 constexpr std::uint32_t largest_block_nodes = 4096;
+// Text blocks grow the same way, in bytes; a longer identifier gets a
+// block of its own size.
+constexpr std::size_t first_text_bytes = 256;
+constexpr std::size_t largest_text_bytes = 65536;
 
 int height(const node *n) {
     return n ? n->sat_height : 0;
@@ -201,19 +206,47 @@ kx_int32_t reserve_node(sec_acltree_t tree) {
     return SEC_S_OK;
 }
 
+// A copy of the size bytes at text in the tree's text blocks, or null when
+// no block can be had (reported).
+char *store_text(sec_acltree_t tree, const char *text, std::size_t size) {
+    tree_text *head = tree->sat_texts;
+    if (!head || head->capacity - head->used < size) {
+        std::size_t capacity =
+            head ? std::min(2 * head->capacity, largest_text_bytes) : first_text_bytes;
+        capacity = std::max(capacity, size);
+        std::size_t bytes = sizeof(tree_text) + capacity;
+        auto *fresh = static_cast<tree_text *>(mem_alloc(bytes));
+        if (!fresh) {
+            no_memory("sec__add_acle_to_tree", bytes);
+            return nullptr;
+        }
+        *fresh = tree_text{head, 0, capacity};
+        tree->sat_texts = head = fresh;
+    }
+    char *copy = head->bytes() + head->used;
+    std::memcpy(copy, text, size);
+    head->used += size;
+    return copy;
+}
+
 // Takes the reserved node and gives it a copy of acle.
 kx_int32_t make_node(sec_acltree_t tree, const sec_acle_t acle, const probe &p, node **out) {
     kx_int32_t rc = reserve_node(tree);
     if (rc != SEC_S_OK)
         return rc;
-    sec_acle_t copy = copy_acle_in_one_block(*acle, p.id, p.size);
-    if (!copy)
-        return no_memory("sec__add_acle_to_tree", one_block_size(p.size));
-    if (!type_has_mech(acle->type))
-        std::memset(copy->mech, 0, sizeof copy->mech);
+    char *id = nullptr;
+    if (p.id && !(id = store_text(tree, p.id, p.size)))
+        return SEC_S_NO_MEMORY;
     node_block *block = tree->sat_last_block;
     node *n = &block->nodes()[block->used++];
-    *n = node{copy, nullptr, nullptr, p.key, p.size, 1};
+    *n = node{nullptr, nullptr, nullptr, p.key, p.size, 1, sec_acle_desc{}};
+    n->sat_entry.perm = acle->perm;
+    n->sat_entry.type = acle->type;
+    // The last byte of the field stays NUL.
+    if (type_has_mech(acle->type))
+        std::memcpy(n->sat_entry.mech, acle->mech, SEC_MECH_MAX);
+    n->sat_entry.id = id;
+    n->sat_acle = &n->sat_entry;
     *out = n;
     return SEC_S_OK;
 }
@@ -299,22 +332,24 @@ kx_int32_t sec__del_acle_from_tree(const sec_acle_t acle, sec_acltree_t tree) {
         const char *id = type_has_id(acle->type) && acle->id ? acle->id : "";
         return report<MSG_2650_118>(SEC_S_ACLE_NOT_FOUND, acle->type, mech, id);
     }
-    node *found = *s.slot;
-    release_acle(found->sat_acle);
-    found->sat_acle = nullptr;
+    (*s.slot)->sat_acle = nullptr;
     return SEC_S_OK;
 }
 
 void sec__free_acltree(sec_acltree_t tree) {
     if (!tree)
         return;
-    // Every node is in a block, so freeing needs no walk of the tree.
+    // Nodes hold their entries and the identifiers lie in text blocks, so
+    // freeing is a walk of the blocks, not of the tree.
     for (node_block *b = tree->sat_blocks; b;) {
         node_block *next = b->next;
-        for (std::uint32_t i = 0; i < b->used; ++i)
-            release_acle(b->nodes()[i].sat_acle);
         std::free(b);
         b = next;
+    }
+    for (tree_text *t = tree->sat_texts; t;) {
+        tree_text *next = t->next;
+        std::free(t);
+        t = next;
     }
     std::free(tree);
 }

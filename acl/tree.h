@@ -8,11 +8,12 @@
 // identity order, expanded entries in insertion order. Balance keeps every
 // walk's depth near log2 n, so recursion over the search tree is bounded.
 //
-// Compiling a large ACL file makes one node per line, so a node costs at
-// most one allocation: nodes come from blocks of growing size that the tree
-// owns, and each entry is one block with its identifier behind it. Every
-// node carries the first eight folded bytes of its identifier as a number,
-// which decides most comparisons without reaching the identifier itself.
+// Compiling a large ACL file makes one node per line, so a node costs no
+// allocation of its own: nodes, each with its entry inside it, come from
+// blocks of growing size that the tree owns, and the identifiers are copied
+// one after another into text blocks of the tree. Every node carries the
+// first eight folded bytes of its identifier as a number, which decides
+// most comparisons without reaching the identifier itself.
 #ifndef KXACL_TREE_H
 #define KXACL_TREE_H
 
@@ -23,14 +24,16 @@
 
 namespace kxacl {
 
-// One node; a node whose entry was deleted keeps its place with a null entry.
+// One node; a node whose entry was deleted, or moved to a list as a copy,
+// keeps its place with a null entry.
 struct sec_acltree_node_s {
-    sec_acle_t sat_acle;
+    sec_acle_t sat_acle; // &sat_entry, or null
     sec_acltree_node_s *sat_left;
     sec_acltree_node_s *sat_right;
     std::uint64_t sat_key;     // the identifier's sort key (cu/posix_case.h)
     std::uint32_t sat_id_size; // the identifier's length with its NUL; 0 without one
     int sat_height;
+    sec_acle_desc sat_entry; // its identifier lies in a text block of the tree
 };
 
 // A block of nodes, handed out in insertion order. The nodes follow it.
@@ -41,12 +44,22 @@ struct sec_acltree_block_s {
     sec_acltree_node_s *nodes() { return reinterpret_cast<sec_acltree_node_s *>(this + 1); }
 };
 
+// A block of identifiers, each with its NUL, one after another. The bytes
+// follow it.
+struct sec_acltree_text_s {
+    sec_acltree_text_s *next;
+    std::size_t used;
+    std::size_t capacity;
+    char *bytes() { return reinterpret_cast<char *>(this + 1); }
+};
+
 // A tree of one sub-ACL key. The key is that of its first entry, whose
 // mechanism spelling the sub-ACL keeps. A null sec_acltree_t is the empty tree.
 typedef struct sec_acltree_s {
     sec_acltree_node_s *sat_root;
     sec_acltree_block_s *sat_blocks;     // the first block
     sec_acltree_block_s *sat_last_block; // the one new nodes come from
+    sec_acltree_text_s *sat_texts;       // the one new identifiers go to first
     unsigned char sat_type;
     char sat_mech[SEC_MECH_MAX + 1];
 } sec_acltree_desc, *sec_acltree_t;

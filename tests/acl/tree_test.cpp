@@ -122,13 +122,13 @@ TEST(Acltree, SortedInsertionOfManyIdentities) {
 }
 
 TEST(AllocationFailure, AddAcleToTrees) {
-    // Into an existing tree, whose node block has room: the entry with its
-    // identifier is the one allocation. As a new key: the array grows, and
-    // the tree, its first node block and the entry are made.
+    // Into an existing tree, whose node and text blocks have room: no
+    // allocation at all. As a new key: the array grows, and the tree, its
+    // first node block and its first text block are made.
     struct {
         entry added;
         long allocations;
-    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 1}, {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
+    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 0}, {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
     for (const auto &c : cases) {
         EXPECT_EQ(for_each_allocation_failure([&](long n) {
                       owned_trees trees;
