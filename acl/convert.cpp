@@ -5,6 +5,7 @@
 
 #include "alloc.h"
 #include "byteorder.h"
+#include "cu/posix_case.h"
 #include "entries.h"
 #include "report.h"
 
@@ -172,32 +173,110 @@ kx_int32_t sec__acltrees_to_acl(sec_acltree_t *acltrees, kx_int32_t count, sec_a
     return SEC_S_OK;
 }
 
+namespace {
+
+// Makes room for more entries at the end of the list: the list grows once
+// per sub-ACL.
+kx_int32_t grow_list(sec_acle_list_t list, std::size_t more) {
+    std::size_t count = static_cast<std::size_t>(list->count);
+    if (count + more > 0x7fffffff)
+        return no_memory("sec__acltree_to_aclelist", (count + more) * sizeof(sec_acle_t));
+    std::size_t bytes = (count + more) * sizeof(sec_acle_t);
+    auto *grown = static_cast<sec_acle_t *>(mem_realloc(list->acles, bytes));
+    if (!grown)
+        return no_memory("sec__acltree_to_aclelist", bytes);
+    list->acles = grown;
+    return SEC_S_OK;
+}
+
+// Appends a copy of acle with the id_size bytes of id as its identifier,
+// as an entry of its own, to a list with room for it.
+kx_int32_t append_copy(sec_acle_list_t list, const sec_acle_desc &acle, const char *id,
+                       std::size_t id_size) {
+    sec_acle_t copy = copy_acle_in_one_block(acle, id, id_size);
+    if (!copy)
+        return no_memory("sec__acltree_to_aclelist", one_block_size(id_size));
+    list->acles[list->count++] = copy;
+    return SEC_S_OK;
+}
+
+// The length of the identifier of record e with its NUL, which lies in the
+// field (id_terminated).
+std::size_t id_size_of(const acle_view &e) {
+    return static_cast<std::size_t>(
+               static_cast<const char *>(std::memchr(e.id, '\0', e.id_length)) - e.id) +
+           1;
+}
+
+// A user or group sub-ACL whose records are readable and whose identifiers
+// stand in strictly ascending order, as the library's writers leave them,
+// holds no two entries of one identity: a tree would find no duplicate to
+// merge and would give the entries back in the order they stand.
+bool strictly_ascending(acl_bytes b, const subacl_view &v) {
+    if (v.type != SEC_ACLE_USER && v.type != SEC_ACLE_GROUP)
+        return false;
+    const char *previous = nullptr;
+    std::size_t previous_size = 0;
+    std::size_t offset = v.first_entry;
+    for (std::uint32_t i = 0; i < v.count; ++i) {
+        acle_view e;
+        if (!read_acle(b, offset, &e) || !e.id_terminated())
+            return false;
+        std::size_t size = id_size_of(e);
+        if (previous && kx::posix_case::compare(previous, previous_size, e.id, size) >= 0)
+            return false;
+        previous = e.id;
+        previous_size = size;
+        offset = e.next;
+    }
+    return true;
+}
+
+// Appends the entries of such a sub-ACL as they stand.
+kx_int32_t append_ascending(acl_bytes b, const subacl_view &v, const char *mech,
+                            sec_acle_list_t list) {
+    kx_int32_t rc = grow_list(list, v.count);
+    sec_acle_desc entry{};
+    entry.type = v.type;
+    std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
+    std::size_t offset = v.first_entry;
+    for (std::uint32_t i = 0; rc == SEC_S_OK && i < v.count; ++i) {
+        acle_view e;
+        if (!read_acle(b, offset, &e)) // read once already: never taken
+            return report_corrupt(here(src_acl));
+        entry.perm = e.perm;
+        rc = append_copy(list, entry, e.id, id_size_of(e));
+        offset = e.next;
+    }
+    return rc;
+}
+
+} // namespace
+
 kx_int32_t sec__acltree_to_aclelist(sec_acltree_t tree, sec_acle_list_t aclelist) {
     std::size_t moving = tree_entry_count(tree);
     if (moving == 0)
         return SEC_S_OK;
-    std::size_t count = static_cast<std::size_t>(aclelist->count);
-    if (count + moving > 0x7fffffff)
-        return no_memory("sec__acltree_to_aclelist", (count + moving) * sizeof(sec_acle_t));
-    // Room for the whole tree at once: the list grows once per tree.
-    std::size_t bytes = (count + moving) * sizeof(sec_acle_t);
-    auto *grown = static_cast<sec_acle_t *>(mem_realloc(aclelist->acles, bytes));
-    if (!grown)
-        return no_memory("sec__acltree_to_aclelist", bytes);
-    aclelist->acles = grown;
+    kx_int32_t rc = grow_list(aclelist, moving);
+    if (rc != SEC_S_OK)
+        return rc;
     // The entries live in the tree's blocks: each goes to the list as an
     // entry of its own, in one block with its identifier.
     return walk_acltree(tree, [&](sec_acltree_node_s *n) {
-        sec_acle_t copy = copy_acle_in_one_block(*n->sat_acle, n->sat_acle->id, n->sat_id_size);
-        if (!copy)
-            return no_memory("sec__acltree_to_aclelist", one_block_size(n->sat_id_size));
-        grown[aclelist->count++] = copy;
-        n->sat_acle = nullptr;
-        return SEC_S_OK;
+        kx_int32_t copied = append_copy(aclelist, *n->sat_acle, n->sat_acle->id, n->sat_id_size);
+        if (copied == SEC_S_OK)
+            n->sat_acle = nullptr;
+        return copied;
     });
 }
 
 kx_int32_t append_subacl_to_list(acl_bytes b, const subacl_view &v, sec_acle_list_t list) {
+    if (strictly_ascending(b, v)) {
+        // The mechanism is checked as reading into a tree checks it first.
+        const char *mech = nullptr;
+        kx_int32_t rc = subacl_mech(v, &mech);
+        return rc != SEC_S_OK ? rc : append_ascending(b, v, mech, list);
+    }
     sec_acltree_t tree = nullptr;
     kx_int32_t rc = sec__subacl_to_acltree(b, v, &tree);
     if (rc == SEC_S_OK)
