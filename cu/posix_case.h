@@ -105,6 +105,21 @@ inline std::uint64_t sort_key(const char *text, std::size_t size) noexcept {
     return __builtin_bswap64(detail::fold8(head));
 }
 
+// A hash of a text of size bytes (its NUL included, none before it) that
+// texts comparing equal share: it mixes their folded bytes.
+inline std::uint64_t folded_hash(const char *text, std::size_t size) noexcept {
+    constexpr std::uint64_t odd = 0x9e3779b97f4a7c15ull;
+    std::uint64_t h = size * odd;
+    std::size_t i = 0;
+    for (; size - i >= 8; i += 8)
+        h = (std::rotl(h, 23) ^ detail::fold8(detail::load8(text + i))) * odd;
+    std::uint64_t tail = 0;
+    for (std::size_t k = 0; i + k < size; ++k)
+        tail |= std::uint64_t{static_cast<unsigned char>(text[i + k])} << (8 * k);
+    h = (std::rotl(h, 23) ^ detail::fold8(tail)) * odd;
+    return h ^ (h >> 29);
+}
+
 // A text folded once to be ordered against many others, as evaluation does
 // with one requester and the entries of a sub-ACL: most comparisons are
 // decided by its first eight bytes, taken as one number.

@@ -1,5 +1,7 @@
 // Entry trees: order, duplicates, the array of trees.
 #include <cstdio>
+#include <string>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -121,14 +123,41 @@ TEST(Acltree, SortedInsertionOfManyIdentities) {
     EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "U0199999"}), SEC_S_BAD_ACLE);
 }
 
+TEST(Acltree, ShuffledInsertionOfManyIdentities) {
+    constexpr int count = 50000;
+    std::vector<std::string> ids;
+    for (int i = 0; i < count; ++i)
+        ids.push_back("user-" + std::to_string(i * 7919 % count)); // a permutation
+    owned_tree user;
+    for (const std::string &id : ids)
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id.c_str()}), SEC_S_OK);
+    int seen = 0;
+    const char *previous = "";
+    walk_acltree(user.t, [&](sec_acltree_node_s *n) {
+        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
+        previous = n->sat_acle->id;
+        return ++seen, SEC_S_OK;
+    });
+    EXPECT_EQ(seen, count);
+    for (const char *again : {"USER-0", "User-49999", "user-25000"})
+        EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", again}), SEC_S_BAD_ACLE) << again;
+    entry gone{SEC_ACLE_USER, 0, "unix", "USER-12345"};
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_ACLE_NOT_FOUND);
+    EXPECT_EQ(tree_entry_count(user.t), static_cast<std::size_t>(count - 1));
+}
+
 TEST(AllocationFailure, AddAcleToTrees) {
     // Into an existing tree, whose node and text blocks have room: no
-    // allocation at all. As a new key: the array grows, and the tree, its
-    // first node block and its first text block are made.
+    // allocation at all, or, for the first identity out of order, its
+    // index and order list. As a new key: the array grows, and the tree,
+    // its first node block and its first text block are made.
     struct {
         entry added;
         long allocations;
-    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 0}, {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
+    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 0},
+                 {{SEC_ACLE_USER, 1, "unix", "alice"}, 2}, // out of order: index and list
+                 {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
     for (const auto &c : cases) {
         EXPECT_EQ(for_each_allocation_failure([&](long n) {
                       owned_trees trees;
