@@ -178,6 +178,9 @@ namespace {
 // Makes room for more entries at the end of the list: the list grows once
 // per sub-ACL.
 kx_int32_t grow_list(sec_acle_list_t list, std::size_t more) {
+    // A list without entries has no array: releasing it frees none.
+    if (more == 0)
+        return SEC_S_OK;
     std::size_t count = static_cast<std::size_t>(list->count);
     if (count + more > 0x7fffffff)
         return no_memory("sec__acltree_to_aclelist", (count + more) * sizeof(sec_acle_t));
