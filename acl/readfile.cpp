@@ -288,10 +288,11 @@ kx_int32_t compile_text(read_call &c, char *contents, std::size_t size) {
     std::size_t remaining = size + 1; // the NUL that follows the file's bytes
     c.lineno = 1;
     bool lines_traced = trace_level(TRC_INFO) > 7;
+    const space_bytes spaces;
     for (;;) {
         sec_acle_desc entry{};
         kx_int32_t rc =
-            sec__read_acle_from_text(c.permtmpl, &cursor, &remaining, &c.lineno, &entry);
+            read_acle_from_text(spaces, c.permtmpl, &cursor, &remaining, &c.lineno, &entry);
         if (rc == 0)
             break;
         if (rc != 1)

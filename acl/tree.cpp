@@ -315,7 +315,10 @@ kx_int32_t make_tree(const sec_acle_t acle, sec_acltree_t *tree) {
 bool tree_has_key(sec_acltree_t tree, const sec_acle_t acle) {
     if (tree->sat_type != acle->type)
         return false;
-    return !type_has_mech(acle->type) || cu_strcasecmp_posix_1(tree->sat_mech, acle->mech) == 0;
+    // Both fields end in a NUL within their bytes (an entry's last byte
+    // may be its only one), so they compare as texts without a call.
+    return !type_has_mech(acle->type) || posix_case::compare(tree->sat_mech, sizeof tree->sat_mech,
+                                                             acle->mech, sizeof acle->mech) == 0;
 }
 
 } // namespace
