@@ -115,31 +115,27 @@ template <typename Visit> kx_int32_t walk_acltree(sec_acltree_t tree, Visit &&vi
 // Sorts the identity order list of a tree that has one, if it is not.
 void sort_acltree(sec_acltree_t tree);
 
+namespace detail {
+// Calls visit(n) when n still holds an entry; SEC_S_OK for one that does not.
+template <typename Visit> kx_int32_t visit_held(sec_acltree_node_s *n, Visit &visit) {
+    return n->sat_acle ? visit(n) : SEC_S_OK;
+}
+} // namespace detail
+
 template <typename Visit> kx_int32_t walk_acltree(sec_acltree_t tree, Visit &&visit) {
     if (!tree)
         return SEC_S_OK;
+    kx_int32_t rc = SEC_S_OK;
     if ((tree->sat_type == SEC_ACLE_USER || tree->sat_type == SEC_ACLE_GROUP) && tree->sat_order) {
         sort_acltree(tree);
-        for (std::size_t i = 0; i < tree->sat_count; ++i) {
-            sec_acltree_node_s *n = tree->sat_order[i].node;
-            if (!n->sat_acle)
-                continue;
-            kx_int32_t rc = visit(n);
-            if (rc != SEC_S_OK)
-                return rc;
-        }
-        return SEC_S_OK;
+        for (std::size_t i = 0; rc == SEC_S_OK && i < tree->sat_count; ++i)
+            rc = detail::visit_held(tree->sat_order[i].node, visit);
+        return rc;
     }
     for (sec_acltree_block_s *b = tree->sat_blocks; b; b = b->next)
-        for (std::uint32_t i = 0; i < b->used; ++i) {
-            sec_acltree_node_s *n = &b->nodes()[i];
-            if (!n->sat_acle)
-                continue;
-            kx_int32_t rc = visit(n);
-            if (rc != SEC_S_OK)
-                return rc;
-        }
-    return SEC_S_OK;
+        for (std::uint32_t i = 0; rc == SEC_S_OK && i < b->used; ++i)
+            rc = detail::visit_held(&b->nodes()[i], visit);
+    return rc;
 }
 
 } // namespace kxacl

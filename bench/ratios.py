@@ -40,18 +40,19 @@ def main():
     def cpu(name):
         return get(name)["cpu_time"]
 
+    def vs_baseline(name, args):
+        return cpu(name + args) / cpu(name + ".baseline" + args)
+
     def row(check, value, target, met, fmt="{:.2f}"):
         rows.append((check, fmt.format(value), target, "yes" if met else "**no**"))
 
     for n in ("10", "1000", "100000"):
         for where in ("match_first", "match_last", "no_match"):
-            args = f"/n:{n}/{where}"
-            r = cpu("single_acle_perm" + args) / cpu("single_acle_perm.baseline" + args)
+            r = vs_baseline("single_acle_perm", f"/n:{n}/{where}")
             row(f"sec__single_acle_perm, {n} entries, {where.replace('_', ' ')}", r,
                 "≤ 1.3 × scan", r <= 1.3)
     for k in ("1", "8", "64"):
-        args = f"/groups:{k}/entries:1000"
-        r = cpu("group_acles_perm" + args) / cpu("group_acles_perm.baseline" + args)
+        r = vs_baseline("group_acles_perm", f"/groups:{k}/entries:1000")
         row(f"sec__group_acles_perm, {k} names, 1 000 entries", r, "≤ 1.3 × scan", r <= 1.3)
 
     def compile_time(lines, order):
@@ -73,8 +74,7 @@ def main():
                  "no overflow", "yes"))
 
     for n in ("10", "1000", "100000"):
-        args = f"/entries:{n}"
-        r = cpu("read_acl_file_cached" + args) / cpu("read_acl_file_cached.baseline" + args)
+        r = vs_baseline("read_acl_file_cached", f"/entries:{n}")
         row(f"cached read, {n} entries / bare open+fstat+read+close", r, "≤ 1.5", r <= 1.5)
 
     def threaded(name, threads):

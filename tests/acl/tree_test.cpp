@@ -104,6 +104,19 @@ TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
                                      make_record(3, text_field("bob"))})}));
 }
 
+// The number of entries that a walk of t gives, expecting each identity to
+// sort after the one before it.
+int walked_in_ascending_order(sec_acltree_t t) {
+    int seen = 0;
+    const char *previous = "";
+    walk_acltree(t, [&](sec_acltree_node_s *n) {
+        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
+        previous = n->sat_acle->id;
+        return ++seen, SEC_S_OK;
+    });
+    return seen;
+}
+
 TEST(Acltree, SortedInsertionOfManyIdentities) {
     constexpr int count = 200000;
     owned_tree user;
@@ -112,14 +125,7 @@ TEST(Acltree, SortedInsertionOfManyIdentities) {
         std::snprintf(id, sizeof id, "u%07d", i);
         ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
     }
-    int seen = 0;
-    const char *previous = "";
-    walk_acltree(user.t, [&](sec_acltree_node_s *n) {
-        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
-        previous = n->sat_acle->id;
-        return ++seen, SEC_S_OK;
-    });
-    EXPECT_EQ(seen, count);
+    EXPECT_EQ(walked_in_ascending_order(user.t), count);
     EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "U0199999"}), SEC_S_BAD_ACLE);
 }
 
@@ -131,14 +137,7 @@ TEST(Acltree, ShuffledInsertionOfManyIdentities) {
     owned_tree user;
     for (const std::string &id : ids)
         ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id.c_str()}), SEC_S_OK);
-    int seen = 0;
-    const char *previous = "";
-    walk_acltree(user.t, [&](sec_acltree_node_s *n) {
-        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
-        previous = n->sat_acle->id;
-        return ++seen, SEC_S_OK;
-    });
-    EXPECT_EQ(seen, count);
+    EXPECT_EQ(walked_in_ascending_order(user.t), count);
     for (const char *again : {"USER-0", "User-49999", "user-25000"})
         EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", again}), SEC_S_BAD_ACLE) << again;
     entry gone{SEC_ACLE_USER, 0, "unix", "USER-12345"};
