@@ -4,8 +4,6 @@
 #include <algorithm>
 #include <cstring>
 
-#include <kx_cu.h>
-
 #include "alloc.h"
 #include "cu/posix_case.h"
 #include "entries.h"
