@@ -293,13 +293,17 @@ bool cacl_matches_acl(const struct stat &acl_st, const struct stat &cacl_st) {
 }
 
 cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl) {
-    cacl_verdict v{cacl_state::trusted, 0, {}};
     // lstat: a symbolic link at the CACL name could point at any file of
     // the ACL file's owner (another ACL's CACL file) and is never trusted.
-    if (lstat(cacl, &v.cacl_st) != 0) {
-        v.state = cacl_state::unexaminable;
-        v.err = errno;
-    } else if (!S_ISREG(v.cacl_st.st_mode)) {
+    struct stat cacl_st;
+    if (lstat(cacl, &cacl_st) != 0)
+        return cacl_verdict{cacl_state::unexaminable, errno, {}};
+    return judge_cacl_status(acl_st, cacl_st);
+}
+
+cacl_verdict judge_cacl_status(const struct stat &acl_st, const struct stat &cacl_st) {
+    cacl_verdict v{cacl_state::trusted, 0, cacl_st};
+    if (!S_ISREG(v.cacl_st.st_mode)) {
         v.state = cacl_state::foreign;
     } else if (v.cacl_st.st_size <= 0 ||
                static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
