@@ -124,7 +124,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_create_empty_acl(sec_acl_buffer_t acl) noex
 
 extern "C" ACL_EXTERN kx_int32_t sec_read_acl_from_data(kx_int32_t length, unsigned char *buffer,
                                                         sec_acl_buffer_t acl) noexcept {
-    const api_points &points = api_read_acl_from_data;
+    constexpr api_points points = api_read_acl_from_data;
     api_enter(points, clears_record::yes,
               [&] { trace_data(points.entry_data, num(length), num(buffer), num(acl)); });
     return api_leave(points, read_acl_from_data(length, buffer, acl));
@@ -132,7 +132,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_read_acl_from_data(kx_int32_t length, unsig
 
 extern "C" ACL_EXTERN kx_int32_t sec_convert_acl_to_host(sec_boolean_t verify,
                                                          sec_acl_buffer_t acl) noexcept {
-    const api_points &points = api_convert_acl_to_host;
+    constexpr api_points points = api_convert_acl_to_host;
     api_enter(points, clears_record::yes, [&] {
         traced_descriptor d(acl);
         trace_data(points.entry_data, num(verify), num(acl), num(d.length), num(d.value));
@@ -141,7 +141,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_convert_acl_to_host(sec_boolean_t verify,
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_release_acl(sec_acl_buffer_t acl) noexcept {
-    const api_points &points = api_release_acl;
+    constexpr api_points points = api_release_acl;
     api_enter(points, clears_record::yes, [&] {
         traced_descriptor d(acl);
         trace_data(points.entry_data, num(acl), num(d.length), num(d.value));

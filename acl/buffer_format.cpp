@@ -2,6 +2,7 @@
 // readers bounded by the buffer's length, validation and sub-ACL lookup.
 #include "buffer_format.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include <kx_cu.h>
@@ -56,6 +57,10 @@ bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v) {
     v->mech = v->mech_length ? reinterpret_cast<const char *>(p + layout::at_mech) : nullptr;
     v->first_entry = offset + layout::subacl_header_size + v->mech_length;
     return true;
+}
+
+acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last) {
+    return {b.data, last ? b.size : std::min(b.size, v.end())};
 }
 
 bool acle_view::id_well_formed() const {

@@ -105,6 +105,13 @@ struct subacl_view {
 // Reads the sub-ACL header at offset; false when it does not fit in b.
 bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v);
 
+// The bytes that the records of sub-ACL v may lie in when all the sub-ACLs
+// are walked: up to where the next one starts, and for the last one up to
+// the buffer's end (validation bounds only the others). Overlapping
+// sub-ACLs would otherwise have their records read once for each of them,
+// at a cost that grows with the square of the buffer's length.
+acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last);
+
 // One entry, read within the buffer.
 struct acle_view {
     unsigned char version;

@@ -14,6 +14,7 @@
 #include "files.h"
 #include "frame.h"
 #include "report.h"
+#include "syscalls.h"
 
 namespace kxacl {
 
@@ -84,16 +85,16 @@ class open_cacl {
     ~open_cacl() {
         if (created_ && !succeeded_)
             remove_if_still_ours();
-        close(fd_);
+        sys_close(fd_);
     }
     void succeeded() { succeeded_ = true; }
 
   private:
     void remove_if_still_ours() {
         struct stat ours, named;
-        if (fstat(fd_, &ours) == 0 && lstat(name_, &named) == 0 && ours.st_dev == named.st_dev &&
-            ours.st_ino == named.st_ino)
-            unlink(name_);
+        if (sys_fstat(fd_, &ours) == 0 && sys_lstat(name_, &named) == 0 &&
+            ours.st_dev == named.st_dev && ours.st_ino == named.st_ino)
+            sys_unlink(name_);
     }
     const char *name_;
     int fd_;
@@ -113,7 +114,7 @@ int open_cacl_file(const char *cacl, bool existed, bool *created) {
     if (!existed)
         flags |= O_CREAT | O_EXCL;
     *created = !existed;
-    return open(cacl, flags, 0);
+    return sys_open(cacl, flags, 0);
 }
 
 // The temporary file, removed again unless renamed into place.
@@ -124,9 +125,9 @@ class temp_file {
     temp_file &operator=(const temp_file &) = delete;
     ~temp_file() {
         if (fd >= 0)
-            close(fd);
+            sys_close(fd);
         if (created && !renamed)
-            unlink(name);
+            sys_unlink(name);
     }
     path_buffer name{};
     int fd = -1;
@@ -159,9 +160,9 @@ kx_int32_t create_temp_file(const char *aclfname, std::size_t path_length, temp_
     for (int attempt = 0; attempt < max_temp_attempts; ++attempt) {
         draw_temp_digits(digits, &seed, attempt == 0);
         struct stat st;
-        if (lstat(temp->name, &st) == 0 || errno != ENOENT)
+        if (sys_lstat(temp->name, &st) == 0 || errno != ENOENT)
             continue;
-        int fd = open(temp->name, O_CREAT | O_EXCL | O_NOFOLLOW | O_WRONLY | O_CLOEXEC, 0);
+        int fd = sys_open(temp->name, O_CREAT | O_EXCL | O_NOFOLLOW | O_WRONLY | O_CLOEXEC, 0);
         if (fd >= 0) {
             temp->fd = fd;
             temp->created = true;
@@ -185,23 +186,23 @@ kx_int32_t fill_temp_file(temp_file *temp, const char *cacl, const sec_buffer_s 
                           const struct stat &acl_st) {
     auto length = static_cast<std::size_t>(acl.length);
     errno = 0;
-    ssize_t written = write(temp->fd, acl.value, length);
+    ssize_t written = sys_write(temp->fd, acl.value, length);
     if (written < 0 || static_cast<std::size_t>(written) != length)
         return write_failed(written, length, written < 0 ? errno : 0);
-    if (fchown(temp->fd, acl_st.st_uid, acl_st.st_gid) != 0) {
+    if (sys_fchown(temp->fd, acl_st.st_uid, acl_st.st_gid) != 0) {
         char uid_text[24];
         std::snprintf(uid_text, sizeof uid_text, "%lu", static_cast<unsigned long>(acl_st.st_uid));
         return report<MSG_2650_154>(SEC_S_FILE_ERROR, cacl, uid_text,
                                     static_cast<int>(acl_st.st_gid));
     }
     mode_t mode = acl_st.st_mode & permission_bits;
-    if (fchmod(temp->fd, mode) != 0)
+    if (sys_fchmod(temp->fd, mode) != 0)
         return report<MSG_2650_155>(SEC_S_FILE_ERROR, cacl, static_cast<unsigned>(mode));
     // A failing close can be the first word of a failed write (quota,
     // network file systems): the file is then not known to be complete.
     int fd = temp->fd;
     temp->fd = -1;
-    if (close(fd) != 0)
+    if (sys_close(fd) != 0)
         return write_failed(written, length, errno);
     return SEC_S_OK;
 }
@@ -222,11 +223,11 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
     cacl_name_of(aclfname, cacl);
 
     struct stat acl_st, cacl_st;
-    if (stat(aclfname, &acl_st) != 0)
+    if (sys_stat(aclfname, &acl_st) != 0)
         return status_failed(aclfname, aclfname, errno);
     if (compiled_from && !same_file_version(*compiled_from, acl_st))
         return nothing_written;
-    bool existed = lstat(cacl, &cacl_st) == 0;
+    bool existed = sys_lstat(cacl, &cacl_st) == 0;
     if (!existed) {
         if (errno != ENOENT)
             return status_failed(aclfname, cacl, errno);
@@ -255,7 +256,7 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
         rc = fill_temp_file(&temp, cacl, *acl, acl_st);
     if (rc != SEC_S_OK)
         return rc;
-    if (rename(temp.name, cacl) != 0)
+    if (sys_rename(temp.name, cacl) != 0)
         return report<MSG_2650_177>(SEC_S_FILE_ERROR, temp.name, cacl);
     temp.renamed = true;
     held.succeeded();
@@ -296,7 +297,7 @@ cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl) {
     // lstat: a symbolic link at the CACL name could point at any file of
     // the ACL file's owner (another ACL's CACL file) and is never trusted.
     struct stat cacl_st;
-    if (lstat(cacl, &cacl_st) != 0)
+    if (sys_lstat(cacl, &cacl_st) != 0)
         return cacl_verdict{cacl_state::unexaminable, errno, {}};
     return judge_cacl_status(acl_st, cacl_st);
 }

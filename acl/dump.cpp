@@ -178,7 +178,7 @@ extern "C" ACL_EXTERN void sec__dump_acl(sec_acl_buffer_t acl) noexcept {
             print_failure();
             return;
         }
-        sec__dump_subacl(b, v, "\t");
+        sec__dump_subacl(subacl_records_bytes(b, v, i + 1 == count), v, "\t");
         if (!subacl_length_covers_header(v)) {
             report_corrupt(here(src_acl));
             print_failure();

@@ -39,12 +39,13 @@ kx_int32_t normalise_host_identity(unsigned char type, const char *id,
     if (cu_ipaddr_ntop_1(AF_INET6, address, canonical, sizeof canonical) != 0)
         return internal_error(here(src_acl), -1);
     std::size_t prefix = static_cast<std::size_t>(host - id);
-    std::size_t size = prefix + std::strlen(canonical) + 1;
+    std::size_t canonical_size = std::strlen(canonical) + 1;
+    std::size_t size = prefix + canonical_size;
     normalised->reset(static_cast<char *>(mem_alloc(size)));
     if (!*normalised)
         return no_memory("sec_create_acle", size);
     std::memcpy(normalised->get(), id, prefix);
-    std::strcpy(normalised->get() + prefix, canonical);
+    std::memcpy(normalised->get() + prefix, canonical, canonical_size);
     return SEC_S_OK;
 }
 
@@ -166,7 +167,7 @@ kx_int32_t display_acle_id(sec_acle_t acle, char **mech, char **id) {
 }
 
 // The entry's fields for trace points; a null entry records a zeroed one.
-sec_acle_desc traced_acle(sec_acle_t acle) {
+sec_acle_desc traced_acle(const sec_acle_desc *acle) {
     sec_acle_desc copy{};
     if (acle) {
         copy = *acle;
@@ -245,7 +246,7 @@ using namespace kxacl;
 extern "C" ACL_EXTERN kx_int32_t sec_create_acle(unsigned char type, kx_uint32_t perm,
                                                  const char *mech, const char *id,
                                                  sec_acle_t *acle) noexcept {
-    const api_points &points = api_create_acle;
+    constexpr api_points points = api_create_acle;
     api_enter(points, clears_record::yes, [&] {
         kx_uint32_t wide_type = type;
         trace_data(points.entry_data, num(wide_type), num(perm), text(mech), text(id), num(acle));
@@ -254,7 +255,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_create_acle(unsigned char type, kx_uint32_t
 }
 
 extern "C" ACL_EXTERN void sec_release_acle(sec_acle_t acle) noexcept {
-    const api_points &points = api_release_acle;
+    constexpr api_points points = api_release_acle;
     api_enter(points, clears_record::no, [&] {
         sec_acle_desc e = traced_acle(acle);
         trace_data(points.entry_data, num(acle), num(e.type), num(e.perm), text(e.mech),
@@ -266,7 +267,7 @@ extern "C" ACL_EXTERN void sec_release_acle(sec_acle_t acle) noexcept {
 
 extern "C" ACL_EXTERN kx_int32_t sec_display_acle_id(sec_acle_t acle, char **mech,
                                                      char **id) noexcept {
-    const api_points &points = api_display_acle_id;
+    constexpr api_points points = api_display_acle_id;
     api_enter(points, clears_record::yes, [&] {
         sec_acle_desc e = traced_acle(acle);
         kx_uint32_t wide_type = e.type;

@@ -383,7 +383,7 @@ constexpr int perf_evaluation_level = 2;
 
 extern "C" ACL_EXTERN kx_int32_t sec__register_id_handler(kx_uint32_t type, const char *mech,
                                                           sec_acl_id_handler handler) noexcept {
-    const api_points &points = api_register_id_handler;
+    constexpr api_points points = api_register_id_handler;
     api_enter(points, clears_record::yes,
               [&] { trace_data(points.entry_data, num(type), text(mech), num(handler)); });
     return api_leave(points, register_id_handler(type, mech, handler));
@@ -392,7 +392,7 @@ extern "C" ACL_EXTERN kx_int32_t sec__register_id_handler(kx_uint32_t type, cons
 extern "C" ACL_EXTERN kx_int32_t sec__single_acle_perm(sec_acl_buffer_t acl, unsigned char type,
                                                        char *mech, char *zmech, char *id,
                                                        kx_uint32_t *perm) noexcept {
-    const api_points &points = api_single_acle_perm;
+    constexpr api_points points = api_single_acle_perm;
     kx_uint32_t wide_type = type;
     api_enter(points, clears_record::yes, [&] {
         traced_descriptor d(acl);
@@ -413,7 +413,7 @@ extern "C" ACL_EXTERN kx_int32_t sec__single_acle_perm(sec_acl_buffer_t acl, uns
 extern "C" ACL_EXTERN kx_int32_t sec__group_acles_perm(sec_acl_buffer_t acl, kx_int32_t count,
                                                        sec_buffer_t groups,
                                                        kx_uint32_t *perm) noexcept {
-    const api_points &points = api_group_acles_perm;
+    constexpr api_points points = api_group_acles_perm;
     api_enter(points, clears_record::yes, [&] {
         traced_descriptor d(acl);
         trace_data(points.entry_data, num(acl), num(d.length), num(d.value), num(count),

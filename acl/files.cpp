@@ -13,6 +13,7 @@
 #include "alloc.h"
 #include "frame.h"
 #include "report.h"
+#include "syscalls.h"
 
 namespace kxacl {
 
@@ -74,7 +75,7 @@ kx_int32_t path_from_working_dir(const char *filename, char *aclfname) {
         std::memcpy(aclfname, filename, name_length + 1);
         return SEC_S_OK;
     }
-    if (!getcwd(aclfname, max_path_length + 1))
+    if (!sys_getcwd(aclfname, max_path_length + 1))
         return report<MSG_2650_166>(SEC_S_NO_ACL_FILE, "getcwd()", errno);
     std::size_t dir_length = std::strlen(aclfname);
     if (dir_length + name_length + 1 > max_path_length)
@@ -123,7 +124,7 @@ kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, cha
     }
     // One read of the whole size; a short count is not retried.
     errno = 0;
-    ssize_t got = read(aclfdes, buffer.get(), size);
+    ssize_t got = sys_read(aclfdes, buffer.get(), size);
     if (got < 0 || static_cast<std::uint64_t>(got) != size)
         return short_read(aclfname, size, got, got < 0 ? errno : 0);
     buffer.get()[size] = '\0';
@@ -135,9 +136,9 @@ kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, cha
 kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
                             std::size_t *aclfsize, bool *replaced) {
     struct stat by_name, opened;
-    if (stat(aclfname, &by_name) != 0)
+    if (sys_stat(aclfname, &by_name) != 0)
         return examine_failed(aclfname, errno);
-    if (fstat(aclfdes, &opened) != 0)
+    if (sys_fstat(aclfdes, &opened) != 0)
         return examine_failed(aclfname, errno);
     auto size = static_cast<std::uint64_t>(by_name.st_size);
     // The size comes from the name, the bytes from the descriptor: when the

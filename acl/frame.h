@@ -48,8 +48,9 @@ struct trace_item {
     const void *data;
     kx_uint32_t length;
 };
+// A pointer is recorded as its own bytes (its address), not what it points to.
 template <typename T> trace_item num(const T &value) {
-    return {&value, static_cast<kx_uint32_t>(sizeof value)};
+    return {&value, static_cast<kx_uint32_t>(sizeof value)}; // NOLINT(bugprone-sizeof-expression)
 }
 inline trace_item text(const char *s, const char *if_null = "") {
     const char *t = s ? s : if_null;

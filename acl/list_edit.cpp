@@ -33,7 +33,8 @@ kx_int32_t append_subacls(const sec_buffer_s &acl, sec_acle_list_t list, Wanted 
         if (!read_subacl(b, offset, &v))
             return report_corrupt(here(src_acl));
         if (wanted(v)) {
-            kx_int32_t rc = append_subacl_to_list(b, v, list);
+            acl_bytes records = subacl_records_bytes(b, v, i + 1 == count);
+            kx_int32_t rc = append_subacl_to_list(records, v, list);
             if (rc != SEC_S_OK)
                 return rc;
         }
@@ -191,8 +192,34 @@ kx_int32_t splice(sec_buffer_s &acl, std::size_t offset, std::size_t old_length,
     return SEC_S_OK;
 }
 
+// Where a new sub-ACL goes: right after the last sub-ACL, ahead of any
+// bytes that follow it (validation leaves those alone), so that a walk by
+// the sub-ACL lengths reaches it. False when the last sub-ACL's records do
+// not end where its length says: validation compares the two only for a
+// sub-ACL that another one follows, so one added after it would make the
+// buffer invalid.
+bool end_of_subacls(const sec_buffer_s &acl, std::size_t *end) {
+    acl_bytes b = bytes_of(acl);
+    unsigned count = subacl_count(b);
+    *end = layout::header_size;
+    if (count == 0)
+        return true;
+    subacl_view v;
+    for (unsigned i = 0; i < count; ++i, *end = v.end())
+        if (!read_subacl(b, *end, &v))
+            return false;
+    std::size_t records_end = v.first_entry;
+    for (std::uint32_t n = 0; n < v.count && records_end <= *end; ++n) {
+        acle_view e;
+        if (!read_acle(b, records_end, &e))
+            return false;
+        records_end = e.next;
+    }
+    return records_end == *end && *end <= b.size;
+}
+
 // The sub-ACL of acle's key written back after a change; when the buffer
-// had none, it is appended and counted.
+// had none, it is added after the others and counted.
 kx_int32_t write_back(sec_buffer_s &acl, const edited_subacl &s, const char *routine,
                       bool *removed) {
     unsigned char *fresh = nullptr;
@@ -205,7 +232,10 @@ kx_int32_t write_back(sec_buffer_s &acl, const edited_subacl &s, const char *rou
     if (!s.found) {
         if (stored_subacl_count(acl) == layout::max_subacls)
             return no_memory(routine, static_cast<std::size_t>(acl.length) + fresh_length);
-        rc = splice(acl, static_cast<std::size_t>(acl.length), 0, fresh, fresh_length, routine);
+        std::size_t end = 0;
+        if (!end_of_subacls(acl, &end))
+            return report_corrupt(here(src_acl));
+        rc = splice(acl, end, 0, fresh, fresh_length, routine);
         if (rc == SEC_S_OK)
             set_subacl_count(acl, static_cast<std::uint16_t>(stored_subacl_count(acl) + 1));
         return rc;
@@ -304,7 +334,7 @@ void trace_edit_entry(kx_uint32_t id, sec_acle_t acle, sec_acl_buffer_t acl) {
 }
 
 kx_int32_t add_acle_framed(sec_boolean_t noupdate, sec_acle_t acle, sec_acl_buffer_t acl) {
-    const api_points &points = api_add_acle_to_acl;
+    constexpr api_points points = api_add_acle_to_acl;
     api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
     return api_leave(points, add_acle(noupdate, acle, acl));
 }
@@ -322,7 +352,7 @@ using namespace kxacl;
 
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl,
                                               sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_list_acl;
+    constexpr api_points points = api_list_acl;
     api_enter(points, clears_record::yes, [&] {
         if (acl)
             trace_data(points.entry_data, num(acl->length), num(acl->value), num(aclelist));
@@ -339,7 +369,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl,
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsigned char type,
                                                       char *mech,
                                                       sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_list_acl_by_type;
+    constexpr api_points points = api_list_acl_by_type;
     api_enter(points, clears_record::yes, [&] {
         kx_uint32_t wide_type = type;
         if (acl)
@@ -357,7 +387,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsi
 }
 
 extern "C" ACL_EXTERN void sec_release_aclelist(sec_acle_list_t aclelist) noexcept {
-    const api_points &points = api_release_aclelist;
+    constexpr api_points points = api_release_aclelist;
     api_enter(points, clears_record::no, [&] {
         kx_int32_t count = list_count(aclelist);
         trace_data(points.entry_data, num(aclelist), num(count));
@@ -379,7 +409,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_add_acle_to_acl2(sec_acle_t acle,
 
 extern "C" ACL_EXTERN kx_int32_t sec_del_acle_from_acl(sec_acle_t acle,
                                                        sec_acl_buffer_t acl) noexcept {
-    const api_points &points = api_del_acle_from_acl;
+    constexpr api_points points = api_del_acle_from_acl;
     api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
     return api_leave(points, del_acle(acle, acl));
 }

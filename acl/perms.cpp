@@ -74,7 +74,7 @@ using namespace kxacl;
 
 extern "C" ACL_EXTERN kx_int32_t sec_translate_perms(const char *perms, sec_perm_set_t permset,
                                                      kx_uint32_t *bitmask) noexcept {
-    const api_points &points = api_translate_perms;
+    constexpr api_points points = api_translate_perms;
     api_enter(points, clears_record::no, [&] {
         trace_data(points.entry_data, text(perms, "<nil>"), num(permset), num(bitmask));
     });
@@ -92,7 +92,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_translate_perms(const char *perms, sec_perm
 
 extern "C" ACL_EXTERN kx_int32_t sec_translate_bitmask(kx_uint32_t bitmask, sec_perm_set_t permset,
                                                        char *perms) noexcept {
-    const api_points &points = api_translate_bitmask;
+    constexpr api_points points = api_translate_bitmask;
     // The caller's buffer need not hold a text on entry, so its address is
     // recorded instead of its contents.
     api_enter(points, clears_record::no,

@@ -18,6 +18,7 @@
 #include "parse.h"
 #include "report.h"
 #include "tree.h"
+#include "syscalls.h"
 
 namespace kxacl {
 
@@ -96,7 +97,7 @@ kx_int32_t examine_acl_file(read_call &c) {
     kx_int32_t rc = sec__get_aclfname(c.filename, c.username, c.aclpath, &c.uid);
     if (rc != SEC_S_OK)
         return rc;
-    int err = stat(c.aclpath, &c.acl_st) != 0 ? errno : 0;
+    int err = sys_stat(c.aclpath, &c.acl_st) != 0 ? errno : 0;
     if (timer.wanted())
         trace_perf(1, c.aclpath, timer);
     if (err != 0 || !S_ISREG(c.acl_st.st_mode))
@@ -128,7 +129,7 @@ void trace_verdict(const read_call &c, const cacl_verdict &v) {
 // can hang the call if a FIFO replaced it.
 int open_timed(const char *source, int flags) {
     perf_timer timer(perf_at(2));
-    int fd = open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC | flags);
+    int fd = sys_open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC | flags);
     int err = errno;
     if (timer.wanted())
         trace_perf(4, source, timer);
@@ -140,7 +141,7 @@ struct descriptor {
     int fd;
     ~descriptor() {
         if (fd >= 0)
-            close(fd);
+            sys_close(fd);
     }
 };
 
@@ -163,8 +164,8 @@ int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
             v = cacl_verdict{cacl_state::unexaminable, ELOOP, {}};
     } else if (file.fd >= 0) {
         struct stat st;
-        v = fstat(file.fd, &st) == 0 ? judge_cacl_status(c.acl_st, st)
-                                     : cacl_verdict{cacl_state::unexaminable, errno, {}};
+        v = sys_fstat(file.fd, &st) == 0 ? judge_cacl_status(c.acl_st, st)
+                                         : cacl_verdict{cacl_state::unexaminable, errno, {}};
     }
     if (info)
         trace_verdict(c, v);
@@ -192,7 +193,7 @@ bool opened_text_acceptable(const read_call &c, int fd) {
     if (!c.username)
         return true;
     struct stat st;
-    if (fstat(fd, &st) != 0)
+    if (sys_fstat(fd, &st) != 0)
         return false;
     return st.st_size == 0 || owner_rule_holds(c, st);
 }

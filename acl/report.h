@@ -8,7 +8,6 @@
 #include <climits>
 #include <cstddef>
 #include <cstdint>
-#include <source_location>
 #include <type_traits>
 #include <utility>
 
@@ -24,14 +23,15 @@ inline constexpr const char src_acl[] = "kxacl_acl";
 inline constexpr const char src_utils[] = "kxacl_utils";
 
 // A source position for the messages that end in one: the area's file name
-// and the line of the call that made it.
+// and the line of the call that made it. __builtin_LINE as a default
+// argument is the caller's line with GCC and Clang alike; clang 14 cannot
+// compile libstdc++'s std::source_location.
 struct source_pos {
     const char *file;
     int line;
 };
-inline source_pos here(const char *file,
-                       std::source_location where = std::source_location::current()) {
-    return {file, static_cast<int>(where.line())};
+inline source_pos here(const char *file, int line = __builtin_LINE()) {
+    return {file, line};
 }
 
 // A pointer shown by a %x placeholder: its low 32 bits.

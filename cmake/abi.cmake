@@ -10,6 +10,11 @@ set(KX_ACL_SOVERSION 1)
 # Gives a shared library its version, SONAME and linker version script.
 function(kx_shared_library target version soversion script)
   set_target_properties(${target} PROPERTIES VERSION ${version} SOVERSION ${soversion})
-  target_link_options(${target} PRIVATE "-Wl,--version-script=${script}" "-Wl,--no-undefined")
+  target_link_options(${target} PRIVATE "-Wl,--version-script=${script}")
+  # clang leaves the sanitizer runtimes out of shared libraries: the fuzz
+  # targets that load them provide those symbols.
+  if(NOT KX_FUZZ)
+    target_link_options(${target} PRIVATE "-Wl,--no-undefined")
+  endif()
   set_property(TARGET ${target} APPEND PROPERTY LINK_DEPENDS ${script})
 endfunction()

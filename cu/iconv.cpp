@@ -9,8 +9,10 @@
 #include <iconv.h>
 #include <pthread.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <iterator>
 #include <new>
 
 struct cu_iconv_s {
@@ -25,7 +27,8 @@ namespace {
 constexpr kx_uint32_t kOpenFlags =
     CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_STANDARD | CU_ICONV_UTF8_BMP_ONLY;
 
-const iconv_t kBadIconv = reinterpret_cast<iconv_t>(-1);
+// iconv_open's failure value, which the interface defines as (iconv_t)-1.
+const iconv_t kBadIconv = reinterpret_cast<iconv_t>(-1); // NOLINT(performance-no-int-to-ptr)
 
 bool from_utf8(const cu_iconv_s &h) noexcept {
     return (h.flags & CU_ICONV_FROM_UTF8) != 0;
@@ -272,10 +275,9 @@ bool env_is_true(const char *name) noexcept {
     const char *value = std::getenv(name);
     if (value == nullptr)
         return false;
-    for (const char *yes : {"1", "yes", "true"})
-        if (cu_strcasecmp_posix_1(value, yes) == 0)
-            return true;
-    return false;
+    static constexpr const char *yes[] = {"1", "yes", "true"};
+    return std::any_of(std::begin(yes), std::end(yes),
+                       [value](const char *y) { return cu_strcasecmp_posix_1(value, y) == 0; });
 }
 
 struct Utf8Settings {

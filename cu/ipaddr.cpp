@@ -88,7 +88,7 @@ void write_ipv6(TextWriter &out, const unsigned char *b) noexcept {
         return;
     }
     unsigned groups[8];
-    for (int i = 0; i < 8; ++i)
+    for (std::size_t i = 0; i < 8; ++i)
         groups[i] = static_cast<unsigned>(b[2 * i]) << 8 | b[2 * i + 1];
     const ZeroRun run = longest_zero_run(groups);
     for (int i = 0; i < 8; ++i) {

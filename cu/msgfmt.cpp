@@ -222,7 +222,9 @@ Catalogue open_catalogue(const char *name) noexcept {
     if (name == nullptr || *name == '\0')
         return nullptr;
     const nl_catd catd = catopen(name, NL_CAT_LOCALE);
-    return Catalogue(catd == reinterpret_cast<nl_catd>(-1) ? nullptr : catd);
+    // catopen's failure value, which the interface defines as (nl_catd)-1.
+    const nl_catd failed = reinterpret_cast<nl_catd>(-1); // NOLINT(performance-no-int-to-ptr)
+    return Catalogue(catd == failed ? nullptr : catd);
 }
 
 char *format_record(const cu_error_t &err) noexcept {

@@ -158,6 +158,7 @@ std::vector<shown_entry> list_entries(const invocation &inv, acl_buffer &acl,
             inv.list_mech.empty() ? nullptr : const_cast<char *>(inv.list_mech.c_str()),
             &entries.list));
     std::vector<shown_entry> shown;
+    shown.reserve(static_cast<std::size_t>(entries.list.count));
     for (kx_int32_t i = 0; i < entries.list.count; ++i)
         shown.push_back(show(*entries.list.acles[i], templates));
     return shown;

@@ -97,7 +97,7 @@ void take_string(parser &p, std::string_view opt, const std::optional<std::strin
     p.take_value(opt, v, field);
 }
 
-const std::array option_table =
+constexpr std::array option_table =
     {
         option_entry{"--help", every_command, true, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.help = true; }},

@@ -48,6 +48,34 @@ TEST(AddAcle, NewEntriesAndSubacls) {
                   make_subacl(1, 1, {}, {make_record(2)})}));
 }
 
+// Found by fuzzing: validation lets bytes follow the last sub-ACL, and a
+// new sub-ACL appended behind them could not be reached by its length walk.
+// It goes right after the last sub-ACL; when that one's records do not end
+// where its length says (which validation lets pass for the last one only),
+// no sub-ACL can follow it and the add is refused.
+TEST(AddAcle, NewSubaclGoesBeforeTrailingBytes) {
+    const bytes trailing = {0xde, 0xad};
+    bytes base = make_acl({anyother_r});
+    base.insert(base.end(), trailing.begin(), trailing.end());
+    owned_acl acl(base);
+    ASSERT_EQ(add(acl, {SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_OK);
+    bytes expected = make_acl({anyother_r, user_bob});
+    expected.insert(expected.end(), trailing.begin(), trailing.end());
+    EXPECT_EQ(acl.contents(), expected);
+    EXPECT_EQ(sec_convert_acl_to_host(1, acl.get()), SEC_S_OK);
+
+    for (int wrong_by : {-3, 2}) {
+        bytes last = make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, wrong_by);
+        bytes odd = make_acl({last});
+        odd.insert(odd.end(), trailing.begin(), trailing.end());
+        owned_acl refused(odd);
+        ASSERT_EQ(sec_convert_acl_to_host(1, refused.get()), SEC_S_OK);
+        EXPECT_EQ(add(refused, {SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_BAD_ACL);
+        expect_error(SEC_S_BAD_ACL, MSG_2650_110);
+        EXPECT_EQ(refused.contents(), odd);
+    }
+}
+
 TEST(AddAcle, SameIdentityUpdatesOrIsRefused) {
     owned_acl acl(worked_example);
     bytes updated = worked_example;

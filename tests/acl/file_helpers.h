@@ -108,6 +108,29 @@ inline std::string example_acl() {
 }
 inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
 
+constexpr kx_uint32_t TEXT = SEC_F_ACL_TEXT, CACHE = SEC_F_ACL_CACHE, CONVERT = SEC_F_ACL_CONVERT;
+constexpr kx_uint32_t unset = 0xdeadbeef;
+
+// One call of sec_read_acl_file; the buffer is released with the object.
+// Members in this order: the status is computed once the outputs exist.
+struct acl_read {
+    sec_buffer_s acl{0, nullptr};
+    kx_uint32_t rflags = unset;
+    kx_int32_t status;
+    acl_read(const std::string &file, kx_uint32_t flags, const char *user = nullptr,
+             sec_perm_set_t permtmpl = nullptr)
+        : status(sec_read_acl_file(file.c_str(), user, permtmpl, flags, &acl, &rflags)) {}
+    ~acl_read() { std::free(acl.value); }
+    acl_read(const acl_read &) = delete;
+    acl_read &operator=(const acl_read &) = delete;
+    std::string bytes() const {
+        return acl.value ? std::string(static_cast<const char *>(acl.value),
+                                       static_cast<std::size_t>(acl.length))
+                         : std::string();
+    }
+    bool empty() const { return acl.length == 0 && acl.value == nullptr; }
+};
+
 // An ACL file "acl" in a fresh directory, last changed 10 seconds ago so
 // that a CACL file written now is strictly newer.
 struct acl_dir {

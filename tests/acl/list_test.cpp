@@ -43,6 +43,30 @@ TEST(ListAcl, OrderAndSpellingAsStored) {
     EXPECT_EQ(listed(twice), (texts{"16  Bob 8", "16  carl 4"}));
 }
 
+// Found by fuzzing: a sub-ACL of length 0 made a walk of all sub-ACLs read
+// the same sub-ACL and its record for every count of the header, 60000
+// times for 46 bytes. The records of a sub-ACL that another one follows
+// must end where that one starts.
+TEST(ListAcl, RecordsOfASubaclEndWhereTheNextStarts) {
+    bytes repeated =
+        make_acl({make_subacl(4, 1, text_field("unix"), {make_record(1, text_field("bob"))})});
+    kxacl::store_u32(&repeated[5], 0);
+    repeated[3] = 3;
+    for (unsigned char type : {0, SEC_ACLE_USER}) {
+        owned_acl acl(repeated);
+        owned_list list;
+        EXPECT_EQ(type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
+                       : sec_list_acl(acl.get(), list.get()),
+                  SEC_S_BAD_ACL);
+        expect_error(SEC_S_BAD_ACL, MSG_2650_110);
+        EXPECT_EQ(list.l.count, 0);
+    }
+    // The last sub-ACL's records may run past its length, as validation allows.
+    bytes last_long = make_acl({make_subacl(2, 1, {}, {make_record(1)}),
+                                make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, -7)});
+    EXPECT_EQ(listed(last_long), (texts{"2  - 1", "16  staff 1"}));
+}
+
 TEST(ListAclByType, MechanismsAndTypes) {
     bytes rich = rich_acl();
     EXPECT_EQ(listed(rich, SEC_ACLE_USER, "UNIX"), unix_users);

@@ -26,39 +26,21 @@
 
 using namespace kxacl;
 using kxtest::acl_dir;
+using kxtest::acl_read;
+using kxtest::CACHE;
+using kxtest::CONVERT;
 using kxtest::dir_entries;
 using kxtest::example_acl;
 using kxtest::hex_of;
 using kxtest::hex_text;
 using kxtest::last_error;
+using kxtest::TEXT;
+using kxtest::unset;
 using kxtest::record_is;
 using names = std::vector<std::string>;
 using items = std::vector<std::string>;
 
 namespace {
-
-constexpr kx_uint32_t TEXT = SEC_F_ACL_TEXT, CACHE = SEC_F_ACL_CACHE, CONVERT = SEC_F_ACL_CONVERT;
-constexpr kx_uint32_t unset = 0xdeadbeef;
-
-// One call of sec_read_acl_file; the buffer is released with the object.
-// Members in this order: the status is computed once the outputs exist.
-struct acl_read {
-    sec_buffer_s acl{0, nullptr};
-    kx_uint32_t rflags = unset;
-    kx_int32_t status;
-    acl_read(const std::string &file, kx_uint32_t flags, const char *user = nullptr,
-             sec_perm_set_t permtmpl = nullptr)
-        : status(sec_read_acl_file(file.c_str(), user, permtmpl, flags, &acl, &rflags)) {}
-    ~acl_read() { std::free(acl.value); }
-    acl_read(const acl_read &) = delete;
-    acl_read &operator=(const acl_read &) = delete;
-    std::string bytes() const {
-        return acl.value ? std::string(static_cast<const char *>(acl.value),
-                                       static_cast<std::size_t>(acl.length))
-                         : std::string();
-    }
-    bool empty() const { return acl.length == 0 && acl.value == nullptr; }
-};
 
 // The buffer compiled from text.
 std::string compiled(const std::string &text) {
