@@ -304,13 +304,13 @@ cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl) {
 
 cacl_verdict judge_cacl_status(const struct stat &acl_st, const struct stat &cacl_st) {
     cacl_verdict v{cacl_state::trusted, 0, cacl_st};
-    if (!S_ISREG(v.cacl_st.st_mode)) {
-        v.state = cacl_state::foreign;
-    } else if (v.cacl_st.st_size <= 0 ||
-               static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
-               v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec) {
+    if (S_ISREG(v.cacl_st.st_mode) &&
+        (v.cacl_st.st_size <= 0 ||
+         static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
+         v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec)) {
         v.state = cacl_state::stale;
     } else if (!cacl_matches_acl(acl_st, v.cacl_st)) {
+        // Not a regular file, or another owner, group or permission bits.
         v.state = cacl_state::foreign;
     }
     return v;

@@ -1,6 +1,7 @@
 // Conversion between sub-ACLs, entry trees and entry lists.
 #include "convert.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include "alloc.h"
@@ -206,9 +207,7 @@ kx_int32_t append_copy(sec_acle_list_t list, const sec_acle_desc &acle, const ch
 // The length of the identifier of record e with its NUL, which lies in the
 // field (id_terminated).
 std::size_t id_size_of(const acle_view &e) {
-    return static_cast<std::size_t>(
-               static_cast<const char *>(std::memchr(e.id, '\0', e.id_length)) - e.id) +
-           1;
+    return static_cast<std::size_t>(std::find(e.id, e.id + e.id_length, '\0') - e.id) + 1;
 }
 
 // A user or group sub-ACL whose records are readable and whose identifiers

@@ -373,7 +373,7 @@ using namespace kxacl;
 extern "C" ACL_EXTERN kx_int32_t sec_read_acl_file(const char *filename, const char *username,
                                                    sec_perm_set_t permtmpl, kx_uint32_t flags,
                                                    sec_buffer_t acl, kx_uint32_t *rflags) noexcept {
-    const api_points &points = api_read_acl_file;
+    constexpr api_points points = api_read_acl_file;
     api_enter(points, clears_record::yes, [&] {
         trace_data(points.entry_data, text(filename), text(username), num(permtmpl), num(flags),
                    num(acl));

@@ -68,7 +68,9 @@ template <typename T> cu_error_arg_t record_arg(T v) {
     cu_error_arg_t arg{};
     if constexpr (kind_of<T>() == arg_kind::integer) {
         arg.cu_arg_type = CU_ERROR_ARG_INT;
-        arg.cu_arg_value.cu_arg_int = static_cast<int>(v);
+        // A char goes as its int value, as a variadic %c argument would.
+        arg.cu_arg_value.cu_arg_int =
+            static_cast<int>(v); // NOLINT(bugprone-signed-char-misuse,cert-str34-c)
     } else {
         arg.cu_arg_type = CU_ERROR_ARG_CHAR_STR;
         arg.cu_arg_value.cu_arg_char_str = const_cast<char *>(v ? v : "");
