@@ -9,6 +9,7 @@
 
 #include "alloc.h"
 #include "byteorder.h"
+#include "cu/posix_case.h"
 #include "entries.h"
 #include "report.h"
 
@@ -66,20 +67,6 @@ acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last) {
     return {b.data, last ? b.size : std::min(b.size, v.end())};
 }
 
-bool read_acle(acl_bytes b, std::size_t offset, acle_view *v) {
-    if (offset > b.size || b.size - offset < layout::acle_header_size)
-        return false;
-    const unsigned char *p = b.data + offset;
-    v->version = p[layout::at_acle_version];
-    v->perm = load_u32(p + layout::at_perm);
-    v->id_length = load_u16(p + layout::at_id_length);
-    if (b.size - offset - layout::acle_header_size < v->id_length)
-        return false;
-    v->id = v->id_length ? reinterpret_cast<const char *>(p + layout::at_id) : nullptr;
-    v->next = offset + layout::acle_header_size + v->id_length;
-    return true;
-}
-
 bool acle_view::id_well_formed() const {
     // Bounded: a field without NUL may end the buffer.
     return id_length > 0 && strnlen(id, id_length) + 1 == id_length;
@@ -89,10 +76,10 @@ bool acle_view::id_terminated() const {
     return id_length > 0 && std::memchr(id, '\0', id_length) != nullptr;
 }
 
-bool subacl_mech_equals(const subacl_view &v, const char *mech) {
+bool subacl_mech_equals(const subacl_view &v, const char *mech, std::size_t mech_size) {
     // The stored NUL must lie within the field, so the comparison ends there.
-    return v.mech && std::memchr(v.mech, '\0', v.mech_length) &&
-           cu_strncasecmp_posix_1(mech, v.mech, v.mech_length) == 0;
+    return mech && v.mech && std::memchr(v.mech, '\0', v.mech_length) &&
+           kx::posix_case::compare(mech, mech_size, v.mech, v.mech_length) == 0;
 }
 
 bool new_empty_buffer(sec_buffer_s *acl) {
@@ -207,10 +194,11 @@ kx_int32_t find_subacl_view(const sec_buffer_s &acl, unsigned char type, const c
     acl_bytes b = bytes_of(acl);
     std::size_t offset = layout::header_size;
     unsigned count = subacl_count(b);
+    std::size_t mech_size = type_has_mech(type) && mech ? std::strlen(mech) + 1 : 0;
     for (unsigned i = 0; i < count; ++i) {
         if (!read_subacl(b, offset, v))
             return report_corrupt(here(src_acl));
-        if (v->type == type && (!type_has_mech(type) || subacl_mech_equals(*v, mech))) {
+        if (v->type == type && (!type_has_mech(type) || subacl_mech_equals(*v, mech, mech_size))) {
             if (v->end() > b.size)
                 return report_corrupt(here(src_acl));
             *found = true;

@@ -38,6 +38,7 @@
 
 #include <kx_acl.h>
 
+#include "byteorder.h"
 #include "report.h"
 
 namespace kxacl {
@@ -129,11 +130,25 @@ struct acle_view {
     bool id_terminated() const;
 };
 
-// Reads the entry at offset; false when it does not fit in b.
-bool read_acle(acl_bytes b, std::size_t offset, acle_view *v);
+// Reads the entry at offset; false when it does not fit in b. Inline: the
+// walks of evaluation call it once per entry.
+inline bool read_acle(acl_bytes b, std::size_t offset, acle_view *v) {
+    if (offset > b.size || b.size - offset < layout::acle_header_size)
+        return false;
+    const unsigned char *p = b.data + offset;
+    v->version = p[layout::at_acle_version];
+    v->perm = load_u32(p + layout::at_perm);
+    v->id_length = load_u16(p + layout::at_id_length);
+    if (b.size - offset - layout::acle_header_size < v->id_length)
+        return false;
+    v->id = v->id_length ? reinterpret_cast<const char *>(p + layout::at_id) : nullptr;
+    v->next = offset + layout::acle_header_size + v->id_length;
+    return true;
+}
 
-// The mechanism of a user or expanded sub-ACL equals mech, ignoring case.
-bool subacl_mech_equals(const subacl_view &v, const char *mech);
+// The mechanism of a user or expanded sub-ACL equals mech (of mech_size
+// bytes, its NUL included), ignoring case.
+bool subacl_mech_equals(const subacl_view &v, const char *mech, std::size_t mech_size);
 
 // Validates the structure of a buffer whose header has been accepted and
 // which is in host byte order; reports the first fault found.

@@ -294,16 +294,20 @@ bool cacl_matches_acl(const struct stat &acl_st, const struct stat &cacl_st) {
 }
 
 cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl) {
-    cacl_verdict v{cacl_state::trusted, 0, {}};
     // lstat: a symbolic link at the CACL name could point at any file of
     // the ACL file's owner (another ACL's CACL file) and is never trusted.
-    if (sys_lstat(cacl, &v.cacl_st) != 0) {
-        v.state = cacl_state::unexaminable;
-        v.err = errno;
-    } else if (S_ISREG(v.cacl_st.st_mode) &&
-               (v.cacl_st.st_size <= 0 ||
-                static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
-                v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec)) {
+    struct stat cacl_st;
+    if (sys_lstat(cacl, &cacl_st) != 0)
+        return cacl_verdict{cacl_state::unexaminable, errno, {}};
+    return judge_cacl_status(acl_st, cacl_st);
+}
+
+cacl_verdict judge_cacl_status(const struct stat &acl_st, const struct stat &cacl_st) {
+    cacl_verdict v{cacl_state::trusted, 0, cacl_st};
+    if (S_ISREG(v.cacl_st.st_mode) &&
+        (v.cacl_st.st_size <= 0 ||
+         static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
+         v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec)) {
         v.state = cacl_state::stale;
     } else if (!cacl_matches_acl(acl_st, v.cacl_st)) {
         // Not a regular file, or another owner, group or permission bits.

@@ -53,6 +53,10 @@ struct cacl_verdict {
 // status is acl_st. The name is examined without following a symbolic link.
 cacl_verdict judge_cacl(const struct stat &acl_st, const char *cacl);
 
+// The trust rule for a CACL file whose status, taken without following a
+// symbolic link, is cacl_st; never unexaminable.
+cacl_verdict judge_cacl_status(const struct stat &acl_st, const struct stat &cacl_st);
+
 // A regular file with the ACL file's owner, group and permission bits: the
 // part of the trust rule that the reader applies again to the file it opened.
 bool cacl_matches_acl(const struct stat &acl_st, const struct stat &cacl_st);

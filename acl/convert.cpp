@@ -1,10 +1,12 @@
 // Conversion between sub-ACLs, entry trees and entry lists.
 #include "convert.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include "alloc.h"
 #include "byteorder.h"
+#include "cu/posix_case.h"
 #include "entries.h"
 #include "report.h"
 
@@ -28,32 +30,27 @@ kx_int32_t subacl_mech(const subacl_view &v, const char **mech) {
     return SEC_S_OK;
 }
 
-// Adds the entry of one record to the tree.
+// Adds the entry of one record to the tree, which copies it: the record's
+// identifier is used where it stands in the buffer.
 kx_int32_t add_record(const subacl_view &v, const char *mech, const acle_view &e,
                       sec_acltree_t *tree) {
-    const char *id = nullptr;
+    sec_acle_desc entry{};
+    entry.perm = e.perm;
+    entry.type = v.type;
+    std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
     if (type_has_id(v.type)) {
         // The identifier must end within its record to be read as a text.
         if (!e.id_terminated())
             return report_corrupt(here(src_acl));
-        id = e.id;
+        entry.id = const_cast<char *>(e.id);
     }
-    sec_acle_t entry = nullptr;
-    kx_int32_t rc = sec__create_acle(v.type, e.perm, mech, id, 0, &entry);
-    if (rc != SEC_S_OK)
-        return rc;
-    unique_acle owned(entry);
-    return sec__add_acle_to_tree(0, entry, tree);
+    return sec__add_acle_to_tree(0, &entry, tree);
 }
 
 std::size_t subacl_header_length(sec_acltree_t tree) {
     return type_has_mech(tree->sat_type)
                ? layout::subacl_header_size + std::strlen(tree->sat_mech) + 1
                : layout::subacl_header_size;
-}
-
-std::size_t record_length(const sec_acle_t acle) {
-    return layout::acle_header_size + (type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0);
 }
 
 // The size of the tree's sub-ACL, 0 when it holds no entry. An identifier
@@ -63,8 +60,8 @@ kx_int32_t subacl_length(sec_acltree_t tree, std::size_t *length) {
     *length = 0;
     std::size_t total = 0;
     kx_int32_t rc = walk_acltree(tree, [&](sec_acltree_node_s *n) {
-        std::size_t record = record_length(n->sat_acle);
-        if (record - layout::acle_header_size > layout::max_id_length)
+        std::size_t record = layout::acle_header_size + n->sat_id_size;
+        if (n->sat_id_size > layout::max_id_length)
             return report<MSG_2650_117>(SEC_S_BAD_ACLE, n->sat_acle->type);
         total += record;
         if (total > layout::max_buffer_length)
@@ -90,7 +87,7 @@ std::size_t write_subacl(sec_acltree_t tree, unsigned char *out) {
     walk_acltree(tree, [&](sec_acltree_node_s *n) {
         const sec_acle_t acle = n->sat_acle;
         unsigned char *record = out + offset;
-        std::size_t id_length = type_has_id(acle->type) ? std::strlen(acle->id) + 1 : 0;
+        std::size_t id_length = n->sat_id_size;
         record[layout::at_acle_version] = layout::acle_version;
         store_u32(record + layout::at_perm, acle->perm);
         store_u16(record + layout::at_id_length, static_cast<std::uint16_t>(id_length));
@@ -177,27 +174,111 @@ kx_int32_t sec__acltrees_to_acl(sec_acltree_t *acltrees, kx_int32_t count, sec_a
     return SEC_S_OK;
 }
 
+namespace {
+
+// Makes room for more entries at the end of the list: the list grows once
+// per sub-ACL.
+kx_int32_t grow_list(sec_acle_list_t list, std::size_t more) {
+    // A list without entries has no array: releasing it frees none.
+    if (more == 0)
+        return SEC_S_OK;
+    std::size_t count = static_cast<std::size_t>(list->count);
+    if (count + more > 0x7fffffff)
+        return no_memory("sec__acltree_to_aclelist", (count + more) * sizeof(sec_acle_t));
+    std::size_t bytes = (count + more) * sizeof(sec_acle_t);
+    auto *grown = static_cast<sec_acle_t *>(mem_realloc(list->acles, bytes));
+    if (!grown)
+        return no_memory("sec__acltree_to_aclelist", bytes);
+    list->acles = grown;
+    return SEC_S_OK;
+}
+
+// Appends a copy of acle with the id_size bytes of id as its identifier,
+// as an entry of its own, to a list with room for it.
+kx_int32_t append_copy(sec_acle_list_t list, const sec_acle_desc &acle, const char *id,
+                       std::size_t id_size) {
+    sec_acle_t copy = copy_acle_in_one_block(acle, id, id_size);
+    if (!copy)
+        return no_memory("sec__acltree_to_aclelist", one_block_size(id_size));
+    list->acles[list->count++] = copy;
+    return SEC_S_OK;
+}
+
+// The length of the identifier of record e with its NUL, which lies in the
+// field (id_terminated).
+std::size_t id_size_of(const acle_view &e) {
+    return static_cast<std::size_t>(std::find(e.id, e.id + e.id_length, '\0') - e.id) + 1;
+}
+
+// A user or group sub-ACL whose records are readable and whose identifiers
+// stand in strictly ascending order, as the library's writers leave them,
+// holds no two entries of one identity: a tree would find no duplicate to
+// merge and would give the entries back in the order they stand.
+bool strictly_ascending(acl_bytes b, const subacl_view &v) {
+    if (v.type != SEC_ACLE_USER && v.type != SEC_ACLE_GROUP)
+        return false;
+    const char *previous = nullptr;
+    std::size_t previous_size = 0;
+    std::size_t offset = v.first_entry;
+    for (std::uint32_t i = 0; i < v.count; ++i) {
+        acle_view e;
+        if (!read_acle(b, offset, &e) || !e.id_terminated())
+            return false;
+        std::size_t size = id_size_of(e);
+        if (previous && kx::posix_case::compare(previous, previous_size, e.id, size) >= 0)
+            return false;
+        previous = e.id;
+        previous_size = size;
+        offset = e.next;
+    }
+    return true;
+}
+
+// Appends the entries of such a sub-ACL as they stand.
+kx_int32_t append_ascending(acl_bytes b, const subacl_view &v, const char *mech,
+                            sec_acle_list_t list) {
+    kx_int32_t rc = grow_list(list, v.count);
+    sec_acle_desc entry{};
+    entry.type = v.type;
+    std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
+    std::size_t offset = v.first_entry;
+    for (std::uint32_t i = 0; rc == SEC_S_OK && i < v.count; ++i) {
+        acle_view e;
+        if (!read_acle(b, offset, &e)) // read once already: never taken
+            return report_corrupt(here(src_acl));
+        entry.perm = e.perm;
+        rc = append_copy(list, entry, e.id, id_size_of(e));
+        offset = e.next;
+    }
+    return rc;
+}
+
+} // namespace
+
 kx_int32_t sec__acltree_to_aclelist(sec_acltree_t tree, sec_acle_list_t aclelist) {
     std::size_t moving = tree_entry_count(tree);
     if (moving == 0)
         return SEC_S_OK;
-    std::size_t count = static_cast<std::size_t>(aclelist->count);
-    if (count + moving > 0x7fffffff)
-        return no_memory("sec__acltree_to_aclelist", (count + moving) * sizeof(sec_acle_t));
-    // Room for the whole tree at once: the list grows once per tree.
-    std::size_t bytes = (count + moving) * sizeof(sec_acle_t);
-    auto *grown = static_cast<sec_acle_t *>(mem_realloc(aclelist->acles, bytes));
-    if (!grown)
-        return no_memory("sec__acltree_to_aclelist", bytes);
-    aclelist->acles = grown;
+    kx_int32_t rc = grow_list(aclelist, moving);
+    if (rc != SEC_S_OK)
+        return rc;
+    // The entries live in the tree's blocks: each goes to the list as an
+    // entry of its own, in one block with its identifier.
     return walk_acltree(tree, [&](sec_acltree_node_s *n) {
-        grown[aclelist->count++] = n->sat_acle;
-        n->sat_acle = nullptr;
-        return SEC_S_OK;
+        kx_int32_t copied = append_copy(aclelist, *n->sat_acle, n->sat_acle->id, n->sat_id_size);
+        if (copied == SEC_S_OK)
+            n->sat_acle = nullptr;
+        return copied;
     });
 }
 
 kx_int32_t append_subacl_to_list(acl_bytes b, const subacl_view &v, sec_acle_list_t list) {
+    if (strictly_ascending(b, v)) {
+        // The mechanism is checked as reading into a tree checks it first.
+        const char *mech = nullptr;
+        kx_int32_t rc = subacl_mech(v, &mech);
+        return rc != SEC_S_OK ? rc : append_ascending(b, v, mech, list);
+    }
     sec_acltree_t tree = nullptr;
     kx_int32_t rc = sec__subacl_to_acltree(b, v, &tree);
     if (rc == SEC_S_OK)

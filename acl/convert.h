@@ -24,8 +24,8 @@ kx_int32_t sec__acltree_to_subacl(const sec_acltree_t tree, unsigned char **suba
 // into acl (overwritten). On failure acl is the empty ACL.
 kx_int32_t sec__acltrees_to_acl(sec_acltree_t *acltrees, kx_int32_t count, sec_acl_buffer_t acl);
 
-// Moves the tree's entries, in sub-ACL order, to the end of the list; the
-// tree's nodes keep null entries.
+// Moves the tree's entries, in sub-ACL order, to the end of the list, each
+// as an entry of its own; the tree's nodes keep null entries.
 kx_int32_t sec__acltree_to_aclelist(sec_acltree_t tree, sec_acle_list_t aclelist);
 
 // Appends the entries of the sub-ACL v of b to the list.

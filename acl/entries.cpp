@@ -197,9 +197,30 @@ char type_letter(unsigned type) {
     }
 }
 
+std::size_t one_block_size(std::size_t id_size) {
+    return sizeof(sec_acle_desc) + id_size;
+}
+
+sec_acle_t copy_acle_in_one_block(const sec_acle_desc &acle, const char *id, std::size_t id_size) {
+    auto *copy = static_cast<sec_acle_t>(mem_alloc(one_block_size(id_size)));
+    if (!copy)
+        return nullptr;
+    *copy = sec_acle_desc{};
+    copy->perm = acle.perm;
+    copy->type = acle.type;
+    std::memcpy(copy->mech, acle.mech, SEC_MECH_MAX); // the last byte stays NUL
+    if (id_size) {
+        copy->id = reinterpret_cast<char *>(copy + 1);
+        std::memcpy(copy->id, id, id_size);
+    }
+    return copy;
+}
+
 void release_acle(sec_acle_t acle) {
     if (acle) {
-        std::free(acle->id);
+        // An identifier right behind the record shares its block.
+        if (acle->id != reinterpret_cast<char *>(acle + 1))
+            std::free(acle->id);
         std::free(acle);
     }
 }

@@ -2,6 +2,7 @@
 #ifndef KXACL_ENTRIES_H
 #define KXACL_ENTRIES_H
 
+#include <cstddef>
 #include <memory>
 
 #include <kx_acl.h>
@@ -30,6 +31,15 @@ char type_letter(unsigned type);
 // *acle is null after any failure.
 kx_int32_t sec__create_acle(unsigned char type, kx_uint32_t perm, const char *mech, const char *id,
                             sec_boolean_t translate, sec_acle_t *acle);
+
+// A copy of acle's permission, type and mechanism and, when id_size is not
+// 0, of the id_size bytes at id (a NUL included) as its identifier, in one
+// block with the identifier right behind the record; null when memory ran
+// out (nothing reported). release_acle releases it like any other entry.
+sec_acle_t copy_acle_in_one_block(const sec_acle_desc &acle, const char *id, std::size_t id_size);
+
+// The bytes that copy_acle_in_one_block asks for.
+std::size_t one_block_size(std::size_t id_size);
 
 // Releases an entry and its identity without trace points.
 void release_acle(sec_acle_t acle);

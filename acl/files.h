@@ -4,6 +4,7 @@
 #define KXACL_FILES_H
 
 #include <cstddef>
+#include <cstdint>
 #include <sys/types.h>
 
 #include <kx_acl.h>
@@ -38,6 +39,12 @@ kx_int32_t acl__lock_acl_file(const char *aclfname, int aclfdes, kx_uint32_t fla
 // of size 0 gives no buffer. On failure *aclfbuf is null and *aclfsize 0.
 kx_int32_t acl__read_acl_file(const char *aclfname, int aclfdes, char **aclfbuf,
                               std::size_t *aclfsize);
+
+// The reading part of acl__read_acl_file for a file whose size is known
+// from a status already taken: size bytes from aclfdes into a new buffer of
+// size + 1 bytes ending in NUL; no buffer for size 0.
+kx_int32_t read_known_size(const char *aclfname, int aclfdes, std::uint64_t size, char **aclfbuf,
+                           std::size_t *aclfsize);
 
 // acl__read_acl_file, telling through *replaced whether it failed because
 // the name denoted another file than the open descriptor, so that a reader

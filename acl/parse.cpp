@@ -30,11 +30,6 @@ bool is_blank(char c) {
     return c == ' ' || c == '\t' || c == '\v';
 }
 
-// Tokens end at white space as the process locale classifies it.
-bool is_locale_space(char c) {
-    return std::isspace(static_cast<unsigned char>(c)) != 0;
-}
-
 // One line of the text, found within the remaining length.
 struct text_line {
     char *start;
@@ -62,7 +57,8 @@ text_line find_line(char *start, std::size_t remaining) {
 // the byte that ends it.
 class line_tokens {
   public:
-    explicit line_tokens(const text_line &line) : pos_(line.start), end_(line.end) {}
+    line_tokens(const text_line &line, const space_bytes &spaces)
+        : pos_(line.start), end_(line.end), spaces_(spaces) {}
 
     // The next token, or null when only blanks and perhaps a comment remain.
     // A token may be empty when a locale white-space byte that is not a
@@ -73,7 +69,7 @@ class line_tokens {
         if (pos_ == end_ || *pos_ == '#')
             return nullptr;
         char *token = pos_;
-        while (pos_ < end_ && !is_locale_space(*pos_))
+        while (pos_ < end_ && !spaces_(*pos_))
             ++pos_;
         // The line's end character may be overwritten too: it has been found.
         bool line_goes_on = pos_ < end_;
@@ -86,6 +82,7 @@ class line_tokens {
   private:
     char *pos_;
     char *end_;
+    const space_bytes &spaces_;
 };
 
 // The type code of a type token, 0 when it is not one.
@@ -194,13 +191,13 @@ line_outcome corrupt_line(int lineno) {
     return {report<MSG_2650_144>(SEC_S_BAD_ACL, lineno), true};
 }
 
-line_outcome parse_line(const text_line &line, std::size_t remaining, sec_perm_set_t permset,
-                        int lineno, sec_acle_t acle) {
+line_outcome parse_line(const space_bytes &spaces, const text_line &line, std::size_t remaining,
+                        sec_perm_set_t permset, int lineno, sec_acle_t acle) {
     if (line.size() > max_line_length)
         return {line_too_long(lineno, line.size()), false};
     if (!line.terminated)
         return corrupt_line(lineno);
-    line_tokens tokens(line);
+    line_tokens tokens(line, spaces);
     kx_int32_t rc = parse_entry(tokens, permset, lineno, acle);
     if (rc != SEC_S_OK)
         return {rc, false};
@@ -212,15 +209,25 @@ line_outcome parse_line(const text_line &line, std::size_t remaining, sec_perm_s
 
 } // namespace
 
+space_bytes::space_bytes() {
+    for (int c = 0; c < 256; ++c)
+        space_[c] = std::isspace(c) != 0;
+}
+
 kx_int32_t sec__read_acle_from_text(sec_perm_set_t permset, char **tacl, std::size_t *length,
                                     int *lineno, sec_acle_t acle) {
+    return read_acle_from_text(space_bytes(), permset, tacl, length, lineno, acle);
+}
+
+kx_int32_t read_acle_from_text(const space_bytes &spaces, sec_perm_set_t permset, char **tacl,
+                               std::size_t *length, int *lineno, sec_acle_t acle) {
     std::memset(acle, 0, sizeof *acle);
     char *start = *tacl;
     // A length of 0 leaves not even the terminating NUL to look at.
     if (!start || *length == 0 || *start == '\0')
         return 0;
     text_line line = find_line(start, *length);
-    line_outcome outcome = parse_line(line, *length, permset, *lineno, acle);
+    line_outcome outcome = parse_line(spaces, line, *length, permset, *lineno, acle);
     ++*lineno;
     if (outcome.status != SEC_S_OK) {
         if (!outcome.cursor_stays)

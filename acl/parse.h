@@ -21,6 +21,22 @@ inline constexpr std::size_t max_line_length = 1096;
 kx_int32_t sec__read_acle_from_text(sec_perm_set_t permset, char **tacl, std::size_t *length,
                                     int *lineno, sec_acle_t acle);
 
+// The bytes that the process locale counts as white space, where tokens
+// end: asked of the locale once for a whole text rather than per byte.
+class space_bytes {
+  public:
+    space_bytes();
+    bool operator()(char c) const { return space_[static_cast<unsigned char>(c)]; }
+
+  private:
+    bool space_[256];
+};
+
+// sec__read_acle_from_text with the locale's white space already known,
+// for a caller that reads a whole text line by line.
+kx_int32_t read_acle_from_text(const space_bytes &spaces, sec_perm_set_t permset, char **tacl,
+                               std::size_t *length, int *lineno, sec_acle_t acle);
+
 } // namespace kxacl
 
 #endif

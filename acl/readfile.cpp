@@ -7,6 +7,7 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 #include "alloc.h"
 #include "buffer_format.h"
@@ -16,8 +17,8 @@
 #include "frame.h"
 #include "parse.h"
 #include "report.h"
-#include "syscalls.h"
 #include "tree.h"
+#include "syscalls.h"
 
 namespace kxacl {
 
@@ -38,10 +39,18 @@ struct read_call {
     kx_uint32_t flags; // the working copy, handed back in rflags
     sec_buffer_t acl;
     int lineno = 0; // the line that parsing reached; 0 when nothing was parsed
-    path_buffer aclpath{};
-    path_buffer caclpath{};
+    // Written before they are read; a call on the request path does not
+    // clear 8 KiB of them first.
+    path_buffer aclpath;
+    path_buffer caclpath;
     struct stat acl_st {};
     uid_t uid = 0;
+
+    read_call(const char *filename_, const char *username_, sec_perm_set_t permtmpl_,
+              kx_uint32_t flags_, sec_buffer_t acl_)
+        : filename(filename_), username(username_), permtmpl(permtmpl_), flags(flags_), acl(acl_) {
+        aclpath[0] = caclpath[0] = '\0';
+    }
 };
 
 void trace_perf(kx_uint32_t id, const char *name, const perf_timer &timer) {
@@ -96,17 +105,7 @@ kx_int32_t examine_acl_file(read_call &c) {
     return SEC_S_OK;
 }
 
-// Applies the trust rule to the CACL file; true when its bytes may be used.
-// An ACL path too long for a CACL name cannot have a CACL file.
-bool cacl_trusted(read_call &c) {
-    if (!cacl_name_of(c.aclpath, c.caclpath))
-        return false;
-    bool info = info_traced();
-    if (info)
-        trace_data(117, text(c.caclpath));
-    cacl_verdict v = judge_cacl(c.acl_st, c.caclpath);
-    if (!info)
-        return v.state == cacl_state::trusted;
+void trace_verdict(const read_call &c, const cacl_verdict &v) {
     switch (v.state) {
     case cacl_state::trusted:
         break;
@@ -124,23 +123,17 @@ bool cacl_trusted(read_call &c) {
         break;
     }
     }
-    return v.state == cacl_state::trusted;
 }
 
-// Opens the source for reading. A symbolic link at the CACL name is never
-// followed, and neither file can hang the call if a FIFO replaced it.
-int open_source(const char *source, bool is_cacl) {
-    int flags = O_RDONLY | O_NONBLOCK | O_CLOEXEC | (is_cacl ? O_NOFOLLOW : 0);
+// Opens a file for reading, with the Perf point of opening. Neither file
+// can hang the call if a FIFO replaced it.
+int open_timed(const char *source, int flags) {
     perf_timer timer(perf_at(2));
-    int fd = sys_open(source, flags);
-    if (fd < 0) {
-        int err = errno;
-        if (info_traced())
-            trace_data(122, text(source), num(err));
-        errno = err;
-    }
+    int fd = sys_open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC | flags);
+    int err = errno;
     if (timer.wanted())
         trace_perf(4, source, timer);
+    errno = err;
     return fd;
 }
 
@@ -152,62 +145,106 @@ struct descriptor {
     }
 };
 
-// The file that was opened still passes the checks that its name passed:
-// a CACL file swapped in after the trust test must again be a regular file
-// of the ACL file's owner and permission bits, and with a user name the
-// ACL file must again be that user's.
-bool opened_file_acceptable(const read_call &c, int fd, bool is_cacl) {
-    if (!is_cacl && !c.username)
+// Opens the CACL file and applies the trust rule to the file opened, so
+// that the file judged is the file read, with no second look at its name.
+// A symbolic link at the name is never followed; refused by O_NOFOLLOW, it
+// is judged from its own status. The descriptor, or -1 when the bytes may
+// not be used; an ACL path too long for a CACL name cannot have a CACL file.
+int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
+    if (!cacl_name_of(c.aclpath, c.caclpath))
+        return -1;
+    bool info = info_traced();
+    if (info)
+        trace_data(117, text(c.caclpath));
+    descriptor file{open_timed(c.caclpath, O_NOFOLLOW)};
+    cacl_verdict v{cacl_state::unexaminable, errno, {}};
+    if (file.fd < 0 && v.err == ELOOP) {
+        v = judge_cacl(c.acl_st, c.caclpath);
+        if (v.state == cacl_state::trusted) // replaced since the open
+            v = cacl_verdict{cacl_state::unexaminable, ELOOP, {}};
+    } else if (file.fd >= 0) {
+        struct stat st;
+        v = sys_fstat(file.fd, &st) == 0 ? judge_cacl_status(c.acl_st, st)
+                                         : cacl_verdict{cacl_state::unexaminable, errno, {}};
+    }
+    if (info)
+        trace_verdict(c, v);
+    if (v.state != cacl_state::trusted)
+        return -1;
+    *cacl_st = v.cacl_st;
+    return std::exchange(file.fd, -1);
+}
+
+// Opens the text ACL file for reading.
+int open_text(const read_call &c) {
+    int fd = open_timed(c.aclpath, 0);
+    if (fd < 0) {
+        int err = errno;
+        if (info_traced())
+            trace_data(122, text(c.aclpath), num(err));
+        errno = err;
+    }
+    return fd;
+}
+
+// With a user name, the text ACL file that was opened must again be that
+// user's: it may have been replaced since its name was examined.
+bool opened_text_acceptable(const read_call &c, int fd) {
+    if (!c.username)
         return true;
     struct stat st;
     if (sys_fstat(fd, &st) != 0)
         return false;
-    if (is_cacl)
-        return cacl_matches_acl(c.acl_st, st);
     return st.st_size == 0 || owner_rule_holds(c, st);
 }
 
-// Opens, locks and reads one source whole. *replaced tells a read that
-// failed because the name was given to another file meanwhile.
-kx_int32_t read_source(read_call &c, bool is_cacl, unique_mem<char> *contents, std::size_t *size,
+// Opens, locks and reads the text ACL file whole. *replaced tells a read
+// that failed because the name was given to another file meanwhile.
+kx_int32_t read_source(read_call &c, unique_mem<char> *contents, std::size_t *size,
                        bool *replaced) {
-    const char *source = is_cacl ? c.caclpath : c.aclpath;
     *replaced = false;
     if (info_traced())
-        trace_data(121, text(source));
-    // A CACL file that cannot be used is not reported: its reader gives way
-    // to the text and clears the record anyway.
-    descriptor file{open_source(source, is_cacl)};
+        trace_data(121, text(c.aclpath));
+    descriptor file{open_text(c)};
     if (file.fd < 0) {
         int err = errno;
-        return is_cacl ? SEC_S_FILE_ERROR : report<MSG_2650_137>(SEC_S_FILE_ERROR, c.aclpath, err);
+        return report<MSG_2650_137>(SEC_S_FILE_ERROR, c.aclpath, err);
     }
-    if (!opened_file_acceptable(c, file.fd, is_cacl))
-        return is_cacl ? SEC_S_FILE_ERROR : wrong_owner(c);
+    if (!opened_text_acceptable(c, file.fd))
+        return wrong_owner(c);
     perf_timer timer(perf_at(1));
-    acl__lock_acl_file(source, file.fd, 1);
+    acl__lock_acl_file(c.aclpath, file.fd, 1);
     char *bytes = nullptr;
-    kx_int32_t rc = read_whole_file(source, file.fd, &bytes, size, replaced);
+    kx_int32_t rc = read_whole_file(c.aclpath, file.fd, &bytes, size, replaced);
     contents->reset(bytes);
     if (timer.wanted())
-        trace_perf(2, source, timer);
+        trace_perf(2, c.aclpath, timer);
     return rc;
 }
 
-// Takes the trusted CACL file: its bytes become the ACL buffer, passed
-// through sec_convert_acl_to_host when the caller asks. False, with the
-// error record cleared and acl empty, when the text must be compiled
-// instead: the CACL file is optional, and nothing about it reaches the caller.
-bool take_cacl(read_call &c) {
-    unique_mem<char> bytes;
+// Reads the trusted CACL file open as fd, whose status is cacl_st: its
+// bytes become the ACL buffer, passed through sec_convert_acl_to_host when
+// the caller asks. False, with the error record cleared and acl empty,
+// when the text must be compiled instead: the CACL file is optional, and
+// nothing about it reaches the caller.
+bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
+    descriptor file{fd};
+    if (info_traced())
+        trace_data(121, text(c.caclpath));
+    perf_timer timer(perf_at(1));
+    acl__lock_acl_file(c.caclpath, fd, 1);
+    char *bytes = nullptr;
     std::size_t size = 0;
-    bool replaced = false;
-    if (read_source(c, true, &bytes, &size, &replaced) != SEC_S_OK || size == 0 ||
-        size > layout::max_buffer_length) {
+    kx_int32_t rc =
+        read_known_size(c.caclpath, fd, static_cast<std::uint64_t>(cacl_st.st_size), &bytes, &size);
+    unique_mem<char> owned(bytes);
+    if (timer.wanted())
+        trace_perf(2, c.caclpath, timer);
+    if (rc != SEC_S_OK || size == 0 || size > layout::max_buffer_length) {
         cu_set_no_error_1();
         return false;
     }
-    c.acl->value = bytes.release();
+    c.acl->value = owned.release();
     c.acl->length = static_cast<kx_int32_t>(size);
     if ((c.flags & SEC_F_ACL_CONVERT) && sec_convert_acl_to_host(1, c.acl) != SEC_S_OK) {
         clear_acl(c.acl);
@@ -223,7 +260,7 @@ bool take_cacl(read_call &c) {
 kx_int32_t read_text(read_call &c, unique_mem<char> *contents, std::size_t *size) {
     for (int attempt = 1;; ++attempt) {
         bool replaced = false;
-        kx_int32_t rc = read_source(c, false, contents, size, &replaced);
+        kx_int32_t rc = read_source(c, contents, size, &replaced);
         if (rc == SEC_S_OK || !replaced || attempt == max_replaced_reads)
             return rc;
         cu_set_no_error_1();
@@ -252,10 +289,11 @@ kx_int32_t compile_text(read_call &c, char *contents, std::size_t size) {
     std::size_t remaining = size + 1; // the NUL that follows the file's bytes
     c.lineno = 1;
     bool lines_traced = trace_level(TRC_INFO) > 7;
+    const space_bytes spaces;
     for (;;) {
         sec_acle_desc entry{};
         kx_int32_t rc =
-            sec__read_acle_from_text(c.permtmpl, &cursor, &remaining, &c.lineno, &entry);
+            read_acle_from_text(spaces, c.permtmpl, &cursor, &remaining, &c.lineno, &entry);
         if (rc == 0)
             break;
         if (rc != 1)
@@ -312,7 +350,9 @@ kx_int32_t read_acl_file(read_call &c) {
         return wrong_owner(c);
 
     if (!(c.flags & SEC_F_ACL_TEXT)) {
-        if (cacl_trusted(c) && take_cacl(c))
+        struct stat cacl_st;
+        int fd = open_trusted_cacl(c, &cacl_st);
+        if (fd >= 0 && take_cacl(c, fd, cacl_st))
             return SEC_S_OK;
         c.flags |= SEC_F_ACL_TEXT;
     }

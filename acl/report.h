@@ -62,25 +62,46 @@ constexpr bool kinds_match(std::index_sequence<I...>) {
             ...);
 }
 
-// Integers travel as int (the %d, %c and %x placeholders read int), texts as
-// pointers; a null text shows as the empty text.
-template <typename T> auto pass(T v) {
-    if constexpr (kind_of<T>() == arg_kind::integer)
-        return static_cast<int>(v);
-    else
-        return static_cast<const char *>(v ? v : "");
+// One argument of a record: integers as int (the %d, %c and %x placeholders
+// read int), texts as pointers; a null text shows as the empty text.
+template <typename T> cu_error_arg_t record_arg(T v) {
+    cu_error_arg_t arg{};
+    if constexpr (kind_of<T>() == arg_kind::integer) {
+        arg.cu_arg_type = CU_ERROR_ARG_INT;
+        // A char goes as its int value, as a variadic %c argument would.
+        arg.cu_arg_value.cu_arg_int =
+            static_cast<int>(v); // NOLINT(bugprone-signed-char-misuse,cert-str34-c)
+    } else {
+        arg.cu_arg_type = CU_ERROR_ARG_CHAR_STR;
+        arg.cu_arg_value.cu_arg_char_str = const_cast<char *>(v ? v : "");
+    }
+    return arg;
 }
 
 } // namespace detail
 
 // Sets the thread's error record to message Index with args; returns status.
-template <msg Index, typename... Args> kx_int32_t report(kx_int32_t status, Args... args) {
+// The kinds of the arguments are known here, so the record is handed over
+// whole (cu_pset_error_1 copies it) rather than cu_set_error_1 reading them
+// from the message text again: refusing a request sets a record, and that
+// is on the request path. Kept out of line: the hot loops of its callers
+// keep their registers.
+template <msg Index, typename... Args>
+[[gnu::noinline, gnu::cold]] kx_int32_t report(kx_int32_t status, Args... args) {
     static_assert(placeholder_count(message_text(Index)) == sizeof...(Args),
                   "argument count differs from the message's placeholders");
     static_assert(detail::kinds_match<Index, Args...>(std::index_sequence_for<Args...>{}),
                   "argument kinds differ from the message's placeholders");
-    cu_set_error_1(status, nullptr, catalogue_name, catalogue_set, Index, message_text(Index),
-                   detail::pass(args)...);
+    cu_error_arg_t items[sizeof...(Args) + 1] = {detail::record_arg(args)...};
+    const cu_error_t record = {status,
+                               nullptr,
+                               const_cast<char *>(catalogue_name),
+                               catalogue_set,
+                               Index,
+                               const_cast<char *>(message_text(Index)),
+                               static_cast<kx_uint32_t>(sizeof...(Args)),
+                               sizeof...(Args) != 0 ? items : nullptr};
+    cu_pset_error_1(&record);
     return status;
 }
 

@@ -68,11 +68,6 @@ class PlaceholderScanner {
     unsigned unnumbered_ = 0;
 };
 
-// Folds A..Z only, whatever the locale.
-constexpr unsigned char fold_posix(unsigned char c) noexcept {
-    return static_cast<unsigned char>(static_cast<unsigned>(c - 'A') < 26u ? c + ('a' - 'A') : c);
-}
-
 struct FreeDeleter {
     void operator()(void *p) const noexcept { std::free(p); }
 };

@@ -3,6 +3,11 @@
 // A thread's record, and every copy handed out, is one malloc'd block: the
 // cu_error_t, its argument array, then all of its texts. One free releases
 // it, and a failed allocation can never leave a half-built record behind.
+//
+// A cleared record's block is kept as the thread's spare and holds the next
+// record that fits: callers refuse requests by the thousand (a requester
+// without an ACL entry), and each refusal sets a record that the next call
+// clears, which must not cost an allocation every time.
 #include "cu_internal.h"
 
 #include <cfloat>
@@ -29,6 +34,9 @@ char s_null_text[] = "(null)";
 // The calling thread's record; NULL when no error is set. initial-exec keeps
 // the check on the request path to a single load from the thread pointer.
 [[gnu::tls_model("initial-exec")]] thread_local cu_error_t *t_record = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local std::size_t t_record_size = 0;
+[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *t_spare = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local std::size_t t_spare_size = 0;
 [[gnu::tls_model("initial-exec")]] thread_local bool t_reaper_armed = false;
 
 void release_record(cu_error_t *rec) noexcept {
@@ -36,12 +44,27 @@ void release_record(cu_error_t *rec) noexcept {
         std::free(rec);
 }
 
-// Frees the record of an ending thread. A pthread key does this rather than
+// Keeps the block of a record that the thread no longer holds as its spare,
+// the larger of it and the current spare; frees the other.
+void retire_record(cu_error_t *rec, std::size_t size) noexcept {
+    if (rec == nullptr || rec == &s_no_memory_record)
+        return;
+    if (size <= t_spare_size) {
+        std::free(rec);
+        return;
+    }
+    std::free(std::exchange(t_spare, rec));
+    t_spare_size = size;
+}
+
+// Frees the records of an ending thread. A pthread key does this rather than
 // a thread_local destructor: registering one of those allocates, and glibc
 // aborts the process when that allocation fails.
 void reap_thread_record(void *) noexcept {
     t_reaper_armed = false;
     release_record(std::exchange(t_record, nullptr));
+    std::free(std::exchange(t_spare, nullptr));
+    t_spare_size = 0;
 }
 
 bool arm_reaper() noexcept {
@@ -56,16 +79,19 @@ bool arm_reaper() noexcept {
     return true;
 }
 
-// Makes rec the thread's record, or the no-memory record when rec could not
-// be built or could not be made to go away with the thread.
-int store_thread_record(cu_error_t *rec) noexcept {
+// Makes rec (a block of size bytes) the thread's record, or the no-memory
+// record when rec could not be built or could not be made to go away with
+// the thread.
+int store_thread_record(cu_error_t *rec, std::size_t size) noexcept {
     int status = 0;
     if (rec == nullptr || !arm_reaper()) {
         release_record(rec);
         rec = &s_no_memory_record; // static: needs no reaping
+        size = 0;
         status = CU_ERROR_ID_NO_MEMORY;
     }
-    release_record(std::exchange(t_record, rec));
+    cu_error_t *old = std::exchange(t_record, rec);
+    retire_record(old, std::exchange(t_record_size, size));
     return status;
 }
 
@@ -119,16 +145,12 @@ class TextArea {
     char *next_;
 };
 
-// A deep copy of src in one block, or NULL when memory runs out.
-cu_error_t *clone_record(const cu_error_t &src) noexcept {
-    const std::uint32_t arg_cnt = src.cu_args != nullptr ? src.cu_arg_cnt : 0;
-    const std::size_t size = record_size(src, arg_cnt);
-    if (size == 0)
-        return nullptr;
-    auto *block = static_cast<char *>(std::malloc(size));
-    if (block == nullptr)
-        return nullptr;
+std::uint32_t arg_count(const cu_error_t &src) noexcept {
+    return src.cu_args != nullptr ? src.cu_arg_cnt : 0;
+}
 
+// Builds a deep copy of src in block, which has record_size() bytes.
+cu_error_t *fill_record(const cu_error_t &src, std::uint32_t arg_cnt, char *block) noexcept {
     auto *rec = new (block) cu_error_t(src);
     auto *args = reinterpret_cast<cu_error_arg_t *>(block + kArgsOffset);
     TextArea texts(block + kArgsOffset + arg_cnt * sizeof(cu_error_arg_t));
@@ -143,6 +165,32 @@ cu_error_t *clone_record(const cu_error_t &src) noexcept {
             args[i].cu_arg_value.cu_arg_char_str = texts.copy(arg_text(src.cu_args[i]));
     }
     return rec;
+}
+
+// A deep copy of src in one new block, or NULL when memory runs out.
+cu_error_t *clone_record(const cu_error_t &src) noexcept {
+    const std::uint32_t arg_cnt = arg_count(src);
+    const std::size_t size = record_size(src, arg_cnt);
+    auto *block = size != 0 ? static_cast<char *>(std::malloc(size)) : nullptr;
+    return block != nullptr ? fill_record(src, arg_cnt, block) : nullptr;
+}
+
+// Makes a deep copy of src the thread's record, in the spare block when it
+// is large enough.
+int set_thread_record(const cu_error_t &src) noexcept {
+    const std::uint32_t arg_cnt = arg_count(src);
+    const std::size_t needed = record_size(src, arg_cnt);
+    if (needed == 0)
+        return store_thread_record(nullptr, 0);
+    char *block = nullptr;
+    std::size_t size = needed;
+    if (t_spare != nullptr && t_spare_size >= needed) {
+        block = reinterpret_cast<char *>(std::exchange(t_spare, nullptr));
+        size = std::exchange(t_spare_size, 0);
+    } else {
+        block = static_cast<char *>(std::malloc(needed));
+    }
+    return store_thread_record(block != nullptr ? fill_record(src, arg_cnt, block) : nullptr, size);
 }
 
 // The kinds of the arguments a message text takes, numbered 1..count.
@@ -235,7 +283,7 @@ CU_EXTERN int cu_set_error_1(kx_int32_t error_id, const char *ffdc_id, const cha
         args[i] = read_arg(kinds.kind[i], kinds.long_double[i], &ap);
     va_end(ap);
 
-    // A view of the caller's data; clone_record copies everything it names.
+    // A view of the caller's data; set_thread_record copies everything it names.
     const cu_error_t view = {
         error_id,
         const_cast<char *>(ffdc_id),
@@ -246,7 +294,7 @@ CU_EXTERN int cu_set_error_1(kx_int32_t error_id, const char *ffdc_id, const cha
         kinds.count,
         kinds.count != 0 ? args : nullptr,
     };
-    return store_thread_record(clone_record(view));
+    return set_thread_record(view);
 }
 
 CU_EXTERN int cu_pset_error_1(const cu_error_t *err) {
@@ -254,7 +302,7 @@ CU_EXTERN int cu_pset_error_1(const cu_error_t *err) {
         cu_set_no_error_1();
         return 0;
     }
-    return store_thread_record(clone_record(*err));
+    return set_thread_record(*err);
 }
 
 CU_EXTERN void cu_set_no_error_1(void) {
@@ -262,7 +310,7 @@ CU_EXTERN void cu_set_no_error_1(void) {
     if (rec == nullptr) [[likely]]
         return;
     t_record = nullptr;
-    release_record(rec);
+    retire_record(rec, std::exchange(t_record_size, 0));
 }
 
 CU_EXTERN void cu_get_error_1(cu_error_t **err) {

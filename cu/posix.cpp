@@ -2,8 +2,9 @@
 // locale says. Permission evaluation compares names with these on every
 // request, so they stay plain loops with no table or locale look-up.
 #include "cu_internal.h"
+#include "posix_case.h"
 
-using kx::cu::fold_posix;
+using kx::posix_case::fold;
 
 namespace {
 
@@ -27,8 +28,8 @@ CU_EXTERN int cu_strcasecmp_posix_1(const char *s1, const char *s2) {
     const auto *a = reinterpret_cast<const unsigned char *>(s1);
     const auto *b = reinterpret_cast<const unsigned char *>(s2);
     for (;; ++a, ++b) {
-        const unsigned char ca = fold_posix(*a);
-        const unsigned char cb = fold_posix(*b);
+        const unsigned char ca = fold(*a);
+        const unsigned char cb = fold(*b);
         if (ca != cb || ca == '\0')
             return ca - cb;
     }
@@ -40,8 +41,8 @@ CU_EXTERN int cu_strncasecmp_posix_1(const char *s1, const char *s2, size_t n) {
     const auto *a = reinterpret_cast<const unsigned char *>(s1);
     const auto *b = reinterpret_cast<const unsigned char *>(s2);
     for (; n != 0; --n, ++a, ++b) {
-        const unsigned char ca = fold_posix(*a);
-        const unsigned char cb = fold_posix(*b);
+        const unsigned char ca = fold(*a);
+        const unsigned char cb = fold(*b);
         if (ca != cb || ca == '\0')
             return ca - cb;
     }

@@ -121,6 +121,26 @@ FILE_DICT = [b"u unix ", b"U UNIX ", b"e unix ", b"g ", b"n ", b"o ", b"N", b"O"
              b"\xe9", b"@", b"\x00"]
 
 
+# kxacl_args: the first byte picks the parser (0 command line, 1 template
+# file, 2 JSON quoting); command-line words are separated by NUL bytes.
+ARGS_SEEDS = {
+    "check_groups": b"\x00check\x00res.acl\x00--group\x00staff\x00admin\x00--json",
+    "compile_all": b"\x00compile\x00res.acl\x00--user\x00root\x00--cache\x00--templates=t"
+                   b"\x00-o\x00out",
+    "list_filter": b"\x00list\x00--type=user\x00--mech\x00unix\x00--\x00-file",
+    "add_user": b"\x00add\x00buf\x00--user\x00unix\x00ann@h\x00--perms\x00rw\x00--new",
+    "perms_mask": b"\x00perms\x00--mask\x000x1f",
+    "templates_ok": b"\x01# perms\nr 0 read Read it\nw 1 write\n\nx 31 exec   Run it\n",
+    "templates_bad": b"\x01r 0 read\nr 1 again\n",
+    "json_mixed": b"\x02caf\xc3\xa9 \x01\x80 \"q\" \\ \xed\xa0\x80",
+}
+ARGS_DICT = [w.encode() for w in (
+    "compile", "check", "list", "add", "del", "dump", "perms", "--json", "--help",
+    "--templates", "--owner", "--user", "--cache", "-o", "--output", "--text", "--buffer",
+    "--unauthenticated", "--anyother", "--expanded", "--group", "--perms", "--new", "--type",
+    "--mech", "--string", "--mask", "--version", "--", "#", "0x")] + [b"\x00", b"\n"]
+
+
 def write_dir(name, files):
     path = os.path.join(HERE, "corpus", name)
     shutil.rmtree(path, ignore_errors=True)
@@ -167,6 +187,8 @@ def main():
     write_dict("acl_buffer", BUFFER_DICT)
     write_dict("acl_buffer_foreign", BUFFER_DICT)
     write_dict("acl_file", FILE_DICT)
+    write_dir("kxacl_args", ARGS_SEEDS)
+    write_dict("kxacl_args", ARGS_DICT)
 
 
 if __name__ == "__main__":

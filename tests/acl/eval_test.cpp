@@ -1,9 +1,11 @@
 // Permission evaluation and the identity handler registry: the worked
 // example, every failure with its message and arguments, the handler rules,
 // buffers whose counts run past their end, and the trace points.
+#include <algorithm>
 #include <atomic>
 #include <functional>
 #include <cstring>
+#include <random>
 #include <string>
 #include <variant>
 #include <vector>
@@ -203,6 +205,68 @@ TEST(SingleAclePerm, UserWalk) {
         make_acl({make_subacl(SEC_ACLE_USER, 1, text_field("unix"), {rec(0x1, "\xc3\xa9mile")})}));
     EXPECT_EQ(single(accented.get(), 4, "unix", nullptr, "\xc3\x89MILE").status, SEC_S_BAD_ACLE);
     EXPECT_EQ(single(accented.get(), 4, "unix", nullptr, "\xc3\xa9MILE").perm, 0x1u);
+}
+
+// Walks with eight-byte comparisons give what the specified walk with
+// cu_strcasecmp_posix_1 gives, entry by entry: identities that share long
+// prefixes, differ in case or in one byte, stop inside the first eight
+// bytes, hold a NUL inside their field, or end the buffer; in any order.
+TEST(SingleAclePerm, WalksAsTheTextComparisonDoes) {
+    std::mt19937 random(11);
+    const std::string alphabet("aAzZ@[`{09-\x80\xe9");
+    auto text = [&](std::size_t length) {
+        std::string t;
+        while (t.size() < length)
+            t += alphabet[random() % alphabet.size()];
+        return t;
+    };
+    for (int round = 0; round < 300; ++round) {
+        std::string stem = text(random() % 12);
+        std::vector<std::string> fields; // identifier bytes, NUL included
+        for (std::size_t n = 1 + random() % 12; n > 0; --n) {
+            std::string id = stem.substr(0, random() % (stem.size() + 1)) + text(random() % 6);
+            id += '\0';
+            if (random() % 8 == 0)
+                id += text(1 + random() % 9) + '\0'; // bytes after a NUL do not count
+            fields.push_back(id);
+        }
+        if (random() % 2) // mostly ordered, as writers leave them
+            std::sort(fields.begin(), fields.end(), [](const std::string &a, const std::string &b) {
+                return cu_strcasecmp_posix_1(a.c_str(), b.c_str()) < 0;
+            });
+        bytes records;
+        for (std::size_t i = 0; i < fields.size(); ++i) {
+            bytes field(fields[i].begin(), fields[i].end());
+            bytes r = make_record(1u << i, field);
+            records.insert(records.end(), r.begin(), r.end());
+        }
+        bytes sub = make_subacl(SEC_ACLE_USER, static_cast<std::uint32_t>(fields.size()),
+                                text_field("unix"), {});
+        sub.insert(sub.end(), records.begin(), records.end());
+        kxacl::store_u32(&sub[0], static_cast<std::uint32_t>(sub.size()));
+        owned_acl acl(make_acl({sub}));
+        for (int ask = 0; ask < 8; ++ask) {
+            std::string id = ask % 2 ? fields[random() % fields.size()].c_str() : text(1);
+            if (ask % 4 == 1)
+                for (char &c : id)
+                    c = static_cast<char>(c >= 'a' && c <= 'z' ? c - 32 : c);
+            if (ask % 4 == 3)
+                id = stem + text(random() % 4);
+            if (id.empty())
+                id = "a";
+            result expected{SEC_S_BAD_ACLE, 0};
+            for (std::size_t i = 0; i < fields.size(); ++i) {
+                int r = cu_strcasecmp_posix_1(id.c_str(), fields[i].c_str());
+                if (r == 0)
+                    expected = {SEC_S_OK, 1u << i};
+                if (r <= 0)
+                    break;
+            }
+            result got = single(acl.get(), SEC_ACLE_USER, "unix", nullptr, id.c_str());
+            ASSERT_EQ(got.status, expected.status) << round << " " << id;
+            ASSERT_EQ(got.perm, expected.perm) << round << " " << id;
+        }
+    }
 }
 
 TEST(SingleAclePerm, ZmechSelectsTheSubacl) {

@@ -34,6 +34,13 @@ TEST(ListAcl, OrderAndSpellingAsStored) {
         4, 2, text_field("UniX"),
         {make_record(1, text_field("\xe9t\xe9")), make_record(2, text_field("Zo\xc3\xab"))})});
     EXPECT_EQ(listed(b), (texts{"4 UniX Zo\xc3\xab 2", "4 UniX \xe9t\xe9 1"}));
+    // Records of one identity, next to each other or apart, make one entry
+    // with the first spelling and the last mask.
+    bytes twice = make_acl(
+        {make_subacl(16, 4, {},
+                     {make_record(1, text_field("Bob")), make_record(2, text_field("BOB")),
+                      make_record(4, text_field("carl")), make_record(8, text_field("bob"))})});
+    EXPECT_EQ(listed(twice), (texts{"16  Bob 8", "16  carl 4"}));
 }
 
 // Found by fuzzing: a sub-ACL of length 0 made a walk of all sub-ACLs read
@@ -117,10 +124,13 @@ TEST(ListAcl, ReleaseEmptiesTheListOnce) {
     sec_release_aclelist(nullptr);
 }
 
-// Every allocation of a listing fails in turn: the list ends empty.
+// Every allocation of a listing fails in turn: the list ends empty. Two
+// group entries in order take the list and one block per entry; the other
+// listings build trees as well.
 TEST(AllocationFailure, ListAclAndListAclByType) {
     bytes rich = rich_acl();
-    for (unsigned char type : {0, SEC_ACLE_USER, SEC_ACLE_GROUP}) {
+    for (auto [type, allocations] :
+         {std::pair<unsigned char, long>{0, 10}, {SEC_ACLE_USER, 6}, {SEC_ACLE_GROUP, 3}}) {
         EXPECT_GE(for_each_allocation_failure([&](long n) {
                       owned_acl acl(rich);
                       owned_list list;
@@ -136,7 +146,7 @@ TEST(AllocationFailure, ListAclAndListAclByType) {
                       }
                       return rc;
                   }),
-                  4);
+                  allocations);
     }
 }
 

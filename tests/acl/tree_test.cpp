@@ -1,5 +1,7 @@
 // Entry trees: order, duplicates, the array of trees.
 #include <cstdio>
+#include <string>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -45,6 +47,24 @@ TEST(Acltree, UserAndGroupByIdentityExpandedAsAdded) {
     EXPECT_EQ(expanded.walked(), (texts{"z/3", "a/3", "m/3"}));
 }
 
+// Nodes order by the first eight folded bytes and only then by the rest:
+// identities that share those bytes, or end within them, still order and
+// collide exactly as the comparison says.
+TEST(Acltree, IdentitiesSharingTheirFirstEightBytes) {
+    owned_tree user;
+    for (const char *id : {"prefix-of-Tail-b", "prefix-o", "PREFIX-OF-TAIL", "prefix-of-tail-A",
+                           "prefix-", "prefix-of-tail-a-x", "prefix-of"})
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK) << id;
+    EXPECT_EQ(user.walked(),
+              (texts{"prefix-/1", "prefix-o/1", "prefix-of/1", "PREFIX-OF-TAIL/1",
+                     "prefix-of-tail-A/1", "prefix-of-tail-a-x/1", "prefix-of-Tail-b/1"}));
+    for (const char *id : {"Prefix-Of-Tail-B", "PREFIX-O", "prefix-OF"})
+        EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 2, "unix", id}), SEC_S_BAD_ACLE) << id;
+    entry gone{SEC_ACLE_USER, 0, "unix", "PREFIX-OF-TAIL-a"};
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
+    EXPECT_EQ(user.walked().size(), 6u);
+}
+
 TEST(Acltree, DuplicatesRefusedOrMerged) {
     owned_tree user, group, anyother;
     ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "Alice"}), SEC_S_OK);
@@ -84,6 +104,19 @@ TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
                                      make_record(3, text_field("bob"))})}));
 }
 
+// The number of entries that a walk of t gives, expecting each identity to
+// sort after the one before it.
+int walked_in_ascending_order(sec_acltree_t t) {
+    int seen = 0;
+    const char *previous = "";
+    walk_acltree(t, [&](sec_acltree_node_s *n) {
+        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
+        previous = n->sat_acle->id;
+        return ++seen, SEC_S_OK;
+    });
+    return seen;
+}
+
 TEST(Acltree, SortedInsertionOfManyIdentities) {
     constexpr int count = 200000;
     owned_tree user;
@@ -92,25 +125,43 @@ TEST(Acltree, SortedInsertionOfManyIdentities) {
         std::snprintf(id, sizeof id, "u%07d", i);
         ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
     }
-    int seen = 0;
-    const char *previous = "";
-    walk_acltree(user.t, [&](sec_acltree_node_s *n) {
-        EXPECT_LT(cu_strcasecmp_posix_1(previous, n->sat_acle->id), 0);
-        previous = n->sat_acle->id;
-        return ++seen, SEC_S_OK;
-    });
-    EXPECT_EQ(seen, count);
+    EXPECT_EQ(walked_in_ascending_order(user.t), count);
     EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "U0199999"}), SEC_S_BAD_ACLE);
 }
 
+TEST(Acltree, ShuffledInsertionOfManyIdentities) {
+    constexpr int count = 50000;
+    std::vector<std::string> ids;
+    for (int i = 0; i < count; ++i)
+        ids.push_back("user-" + std::to_string(i * 7919 % count)); // a permutation
+    owned_tree user;
+    for (const std::string &id : ids)
+        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id.c_str()}), SEC_S_OK);
+    EXPECT_EQ(walked_in_ascending_order(user.t), count);
+    for (const char *again : {"USER-0", "User-49999", "user-25000"})
+        EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", again}), SEC_S_BAD_ACLE) << again;
+    entry gone{SEC_ACLE_USER, 0, "unix", "USER-12345"};
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_ACLE_NOT_FOUND);
+    EXPECT_EQ(tree_entry_count(user.t), static_cast<std::size_t>(count - 1));
+}
+
 TEST(AllocationFailure, AddAcleToTrees) {
-    // Into an existing tree, and as a new key that grows the array.
-    for (entry added :
-         {entry{SEC_ACLE_USER, 1, "unix", "carol"}, entry{SEC_ACLE_GROUP, 1, "", "x"}}) {
-        EXPECT_GE(for_each_allocation_failure([&](long n) {
+    // Into an existing tree, whose node and text blocks have room: no
+    // allocation at all, or, for the first identity out of order, its
+    // index and order list. As a new key: the array grows, and the tree,
+    // its first node block and its first text block are made.
+    struct {
+        entry added;
+        long allocations;
+    } cases[] = {{{SEC_ACLE_USER, 1, "unix", "carol"}, 0},
+                 {{SEC_ACLE_USER, 1, "unix", "alice"}, 2}, // out of order: index and list
+                 {{SEC_ACLE_GROUP, 1, "", "x"}, 4}};
+    for (const auto &c : cases) {
+        EXPECT_EQ(for_each_allocation_failure([&](long n) {
                       owned_trees trees;
                       EXPECT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
-                      kx_int32_t rc = failing_after(n, [&] { return trees.add(added); });
+                      kx_int32_t rc = failing_after(n, [&] { return trees.add(c.added); });
                       if (rc != SEC_S_OK) {
                           expect_no_memory(rc, {"sec__add_acle_to_trees", "sec__add_acle_to_tree"});
                           std::size_t entries = 0;
@@ -120,7 +171,7 @@ TEST(AllocationFailure, AddAcleToTrees) {
                       }
                       return rc;
                   }),
-                  3);
+                  c.allocations);
     }
 }
 

@@ -126,6 +126,27 @@ TEST_F(ErrorRecordTest, CopiesOutliveLaterErrorsAndClearing) {
     expect_no_error(current_error().get());
 }
 
+// A cleared record's block holds later, smaller records: none of the old
+// record's texts may show through, and a larger one gets a block of its own.
+TEST_F(ErrorRecordTest, RecordsAfterClearingAreWhole) {
+    const std::string long_text(200, 'L');
+    ASSERT_EQ(cu_set_error_1(1, "ffdc", "cat", 1, 2, "%1$s %2$s", long_text.c_str(), "b"), 0);
+    cu_set_no_error_1();
+    ASSERT_EQ(cu_set_error_1(3, nullptr, nullptr, 0, 4, "short %1$d", 9), 0);
+    ErrorPtr shorter = current_error();
+    EXPECT_EQ(shorter->cu_error_id, 3);
+    EXPECT_EQ(shorter->cu_ffdc_id, nullptr);
+    EXPECT_EQ(shorter->cu_msg_cat, nullptr);
+    EXPECT_STREQ(shorter->cu_msg_default, "short %1$d");
+    ASSERT_EQ(shorter->cu_arg_cnt, 1u);
+    EXPECT_EQ(shorter->cu_args[0].cu_arg_value.cu_arg_int, 9);
+
+    const std::string longer(1000, 'M');
+    ASSERT_EQ(cu_set_error_1(5, nullptr, nullptr, 0, 6, "%1$s", longer.c_str()), 0);
+    EXPECT_EQ(current_error()->cu_args[0].cu_arg_value.cu_arg_char_str, longer);
+    EXPECT_EQ(shorter->cu_args[0].cu_arg_value.cu_arg_int, 9);
+}
+
 TEST_F(ErrorRecordTest, PsetStoresACopyAndNullClears) {
     char text[] = "%1$s at %2$d", name[] = "node";
     cu_error_arg_t args[2] = {};

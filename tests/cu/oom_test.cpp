@@ -7,6 +7,7 @@
 #include <atomic>
 #include <cerrno>
 #include <cstring>
+#include <string>
 
 #include "cu_test_util.h"
 
@@ -75,16 +76,31 @@ class OutOfMemoryTest : public ::testing::Test {
     }
 };
 
+// The texts are larger than any record before them, so that the block that
+// a cleared record leaves for the next one cannot hold them.
 TEST_F(OutOfMemoryTest, StoringLeavesTheNoMemoryRecord) {
-    EXPECT_EQ(without_memory([] { return cu_set_error_1(4, "f", "c", 1, 2, "%1$s", "t"); }),
+    static const std::string big(100000, 't');
+    EXPECT_EQ(without_memory([] { return cu_set_error_1(4, "f", "c", 1, 2, "%1$s", big.c_str()); }),
               CU_ERROR_ID_NO_MEMORY);
     EXPECT_EQ(current_error()->cu_error_id, CU_ERROR_ID_NO_MEMORY);
     cu_set_no_error_1(); // must not free the static record
     EXPECT_EQ(current_error()->cu_error_id, 0);
 
-    const cu_error_t mine = {9, nullptr, nullptr, 0, 0, const_cast<char *>("x"), 0, nullptr};
+    const cu_error_t mine = {9, nullptr, nullptr, 0, 0, const_cast<char *>(big.c_str()),
+                             0, nullptr};
     EXPECT_EQ(without_memory([&] { return cu_pset_error_1(&mine); }), CU_ERROR_ID_NO_MEMORY);
     EXPECT_EQ(current_error()->cu_error_id, CU_ERROR_ID_NO_MEMORY);
+}
+
+// A cleared record's block holds the next record that fits, with no
+// allocation at all.
+TEST_F(OutOfMemoryTest, ClearedRecordHoldsTheNextOne) {
+    ASSERT_EQ(cu_set_error_1(4, "f", "c", 1, 2, "%1$s", "a longer argument"), 0);
+    cu_set_no_error_1();
+    EXPECT_EQ(without_memory([] { return cu_set_error_1(5, "f", "c", 1, 3, "%1$s", "short"); }), 0);
+    cu_test::ErrorPtr err = current_error();
+    EXPECT_EQ(err->cu_error_id, 5);
+    EXPECT_STREQ(err->cu_args[0].cu_arg_value.cu_arg_char_str, "short");
 }
 
 TEST_F(OutOfMemoryTest, GettersHandOutStaticResultsThatReleaseAccepts) {
