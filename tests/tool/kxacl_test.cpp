@@ -5,6 +5,7 @@
 
 #include <sys/stat.h>
 
+#include "file_helpers.h"
 #include "run_kxacl.h"
 
 using kxtest::run_kxacl;
@@ -25,10 +26,10 @@ constexpr const char *example_acl = "#ACL for the example resource\n"
 class KxaclTool : public ::testing::Test {
   protected:
     void SetUp() override {
-        dir = kxtest::fresh_dir();
+        dir = kxtest::temp_dir();
         acl = dir + "/res.acl";
-        kxtest::write_text(acl, example_acl);
-        kxtest::age_file(acl, 10); // old enough to be cached
+        kxtest::write_file(acl, example_acl);
+        kxtest::shift_mtime(acl, -10); // old enough to be cached
     }
     // Compiles the example into a buffer file and returns its path.
     std::string compiled() {
@@ -51,9 +52,9 @@ TEST_F(KxaclTool, CompileReportsEntriesAndWritesTheCacheAndTheBuffer) {
     EXPECT_EQ(r.out, acl + ": 7 entries in 5 sub-ACLs, 139 bytes\ncached in " + acl +
                          ".cacl\nwritten to " + dir + "/out.buf\n");
     EXPECT_EQ(r.err, "");
-    const std::string cached = kxtest::read_bytes(acl + ".cacl");
+    const std::string cached = kxtest::read_file(acl + ".cacl");
     EXPECT_EQ(cached.size(), 139u);
-    EXPECT_EQ(kxtest::read_bytes(dir + "/out.buf"), cached);
+    EXPECT_EQ(kxtest::read_file(dir + "/out.buf"), cached);
     EXPECT_EQ(kxtest::dir_entries(dir),
               (std::vector<std::string>{"out.buf", "res.acl", "res.acl.cacl"}));
 
@@ -66,7 +67,7 @@ TEST_F(KxaclTool, CompileReportsEntriesAndWritesTheCacheAndTheBuffer) {
 }
 
 TEST_F(KxaclTool, CompileFailsOnABadLineWithTheLibraryMessage) {
-    kxtest::write_text(acl, "n r\no r\nu unix\n");
+    kxtest::write_file(acl, "n r\no r\nu unix\n");
     auto r = run_kxacl({"compile", acl, "--cache"});
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_EQ(r.out, "");
@@ -92,10 +93,10 @@ TEST_F(KxaclTool, CompileRefusesToWriteACachedFileByName) {
 }
 
 TEST_F(KxaclTool, CompileWithCustomTemplates) {
-    kxtest::write_text(dir + "/perms.txt", "# resource permissions\n"
+    kxtest::write_file(dir + "/perms.txt", "# resource permissions\n"
                                            "v 0 view   See the resource\n"
                                            "m 5 manage Change it\n");
-    kxtest::write_text(acl, "u unix ann vm\no v\n");
+    kxtest::write_file(acl, "u unix ann vm\no v\n");
     const std::string tmpl = "--templates=" + dir + "/perms.txt";
     EXPECT_EQ(run_kxacl({"compile", acl, tmpl}).exit_code, 0);
     const auto r = run_kxacl({"list", acl, tmpl});
@@ -103,7 +104,7 @@ TEST_F(KxaclTool, CompileWithCustomTemplates) {
     // Without the templates the default set has no 'm'.
     EXPECT_NE(run_kxacl({"compile", acl}).err.find("2650-180"), std::string::npos);
 
-    kxtest::write_text(dir + "/perms.txt", "v 0 view\nw 0 write\n");
+    kxtest::write_file(dir + "/perms.txt", "v 0 view\nw 0 write\n");
     const auto bad = run_kxacl({"compile", acl, tmpl});
     EXPECT_EQ(bad.exit_code, 2);
     EXPECT_EQ(bad.err, "kxacl: " + dir + "/perms.txt: line 2: bit 0 is used twice\n");
@@ -144,12 +145,11 @@ TEST_F(KxaclTool, CheckReadsThroughACurrentCachedFile) {
     const std::string other = dir + "/other.buf";
     ASSERT_EQ(run_kxacl({"compile", acl, "-o", other}).exit_code, 0);
     ASSERT_EQ(run_kxacl({"add", other, "--anyother", "--perms", "rwx"}).exit_code, 0);
-    kxtest::write_text(acl + ".cacl", kxtest::read_bytes(other));
+    kxtest::write_file(acl + ".cacl", kxtest::read_file(other));
     EXPECT_EQ(run_kxacl({"check", acl, "--anyother"}).out, "rwx 0x0000000b\n");
     // Once the text is newer, the text is compiled again.
-    kxtest::age_file(acl, 0);
-    ::utimes((acl + ".cacl").c_str(), nullptr);
-    kxtest::age_file(acl + ".cacl", 20);
+    kxtest::shift_mtime(acl, 10);
+    kxtest::shift_mtime(acl + ".cacl", -20);
     EXPECT_EQ(run_kxacl({"check", acl, "--anyother"}).out, "r 0x00000001\n");
 }
 
@@ -165,10 +165,10 @@ TEST_F(KxaclTool, ListShowsTextThatCompilesToTheSameEntries) {
                      "n\n");
     // Compiled again, the listing holds the same entries; sub-ACLs come out
     // in the other order, so listing twice gives back the first text.
-    kxtest::write_text(dir + "/again.acl", r.out);
+    kxtest::write_file(dir + "/again.acl", r.out);
     const std::string again = run_kxacl({"list", dir + "/again.acl"}).out;
     EXPECT_NE(again, r.out);
-    kxtest::write_text(dir + "/again.acl", again);
+    kxtest::write_file(dir + "/again.acl", again);
     EXPECT_EQ(run_kxacl({"list", dir + "/again.acl"}).out, r.out);
     // The buffer file lists the same, and filters by type and mechanism.
     const std::string buf = compiled();
@@ -197,11 +197,11 @@ TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWhole) {
     EXPECT_EQ(run_kxacl({"check", buf, "--user", "unix", "ANN@host1"}).out, "rw 0x00000003\n");
     // Changing the mask of an existing entry, then refusing it with --new.
     EXPECT_EQ(run_kxacl({"add", buf, "--group", "staff", "--perms", "0x1"}).exit_code, 0);
-    const std::string before = kxtest::read_bytes(buf);
+    const std::string before = kxtest::read_file(buf);
     r = run_kxacl({"add", buf, "--group", "staff", "--new", "--json"});
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_EQ(parsed(r)["error"]["id"], "2650-175");
-    EXPECT_EQ(kxtest::read_bytes(buf), before);
+    EXPECT_EQ(kxtest::read_file(buf), before);
 
     r = run_kxacl({"del", buf, "--group", "staff", "--json"});
     ASSERT_EQ(r.exit_code, 0) << r.err;
@@ -218,15 +218,15 @@ TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWhole) {
 
 TEST_F(KxaclTool, EditingNeverTouchesACachedFileInPlace) {
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    const std::string cacl = acl + ".cacl", before = kxtest::read_bytes(cacl);
+    const std::string cacl = acl + ".cacl", before = kxtest::read_file(cacl);
     auto r = run_kxacl({"del", cacl, "--anyother"});
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_NE(r.err.find("refusing to write " + cacl), std::string::npos);
-    EXPECT_EQ(kxtest::read_bytes(cacl), before);
+    EXPECT_EQ(kxtest::read_file(cacl), before);
     // Written elsewhere, the cached file stays as it was.
     r = run_kxacl({"del", cacl, "--anyother", "-o", dir + "/edited.buf"});
     ASSERT_EQ(r.exit_code, 0) << r.err;
-    EXPECT_EQ(kxtest::read_bytes(cacl), before);
+    EXPECT_EQ(kxtest::read_file(cacl), before);
     EXPECT_EQ(run_kxacl({"check", dir + "/edited.buf", "--anyother"}).exit_code, 1);
 }
 
@@ -234,14 +234,14 @@ TEST_F(KxaclTool, AddRefusesATextFileAndReportsLibraryFailures) {
     auto r = run_kxacl({"add", acl, "--anyother"});
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_EQ(r.err.rfind("2650-", 0), 0u) << r.err; // not a buffer
-    EXPECT_EQ(kxtest::read_bytes(acl), example_acl);
+    EXPECT_EQ(kxtest::read_file(acl), example_acl);
     r = run_kxacl({"add", compiled(), "--anyother", "--perms", "rz"});
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_EQ(r.err.rfind("2650-146 ", 0), 0u) << r.err;
 }
 
 TEST_F(KxaclTool, DumpPrintsTheLibraryDumpOnStandardOutput) {
-    kxtest::write_text(acl, "u unix admin1 rw\n");
+    kxtest::write_file(acl, "u unix admin1 rw\n");
     auto r = run_kxacl({"dump", acl});
     ASSERT_EQ(r.exit_code, 0) << r.err;
     EXPECT_EQ(r.err, "");
@@ -268,7 +268,7 @@ TEST_F(KxaclTool, PermsTranslatesBothWays) {
     EXPECT_EQ(r.exit_code, 2);
     EXPECT_EQ(r.err, "kxacl: '0x100000000' is not a 32-bit mask\n");
     // Digits are permission characters when the templates say so.
-    kxtest::write_text(dir + "/t", "1 4 one\n2 7 two\n");
+    kxtest::write_file(dir + "/t", "1 4 one\n2 7 two\n");
     EXPECT_EQ(run_kxacl({"perms", "--string", "21", "--templates", dir + "/t"}).out,
               "12 0x00000090\n");
     EXPECT_EQ(run_kxacl({"perms", "--templates", dir + "/t"}).out,

@@ -14,14 +14,6 @@ struct run_result {
 
 run_result run_kxacl(const std::vector<std::string> &args);
 
-// File helpers of the tool tests.
-std::string fresh_dir();
-void write_text(const std::string &path, const std::string &text);
-std::string read_bytes(const std::string &path);
-// Sets a file's modification time this many seconds into the past.
-void age_file(const std::string &path, int seconds);
-std::vector<std::string> dir_entries(const std::string &dir);
-
 } // namespace kxtest
 
 #endif
