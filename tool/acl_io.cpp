@@ -58,6 +58,8 @@ bool write_all(int fd, const void *data, std::size_t size) {
     return transfer_all(fd, static_cast<const unsigned char *>(data), size, ::write);
 }
 
+} // namespace
+
 std::vector<unsigned char> read_file(const std::string &path) {
     unique_fd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY));
     if (fd.get() < 0)
@@ -75,6 +77,8 @@ std::vector<unsigned char> read_file(const std::string &path) {
     return bytes;
 }
 
+namespace {
+
 // The mode of a new file: that of the file it replaces, else 0644 less the
 // process's umask.
 mode_t mode_for(const std::string &path) {
@@ -85,35 +89,6 @@ mode_t mode_for(const std::string &path) {
     ::umask(mask);
     return 0644 & ~mask;
 }
-
-// A temporary file beside its target, removed unless it was renamed.
-class temp_file {
-  public:
-    explicit temp_file(const std::string &target) : name_(target + ".XXXXXX") {
-        fd_ = ::mkostemp(name_.data(), O_CLOEXEC);
-        if (fd_ < 0)
-            throw tool_error(system_error("cannot create a temporary file for", target));
-    }
-    temp_file(const temp_file &) = delete;
-    temp_file &operator=(const temp_file &) = delete;
-    ~temp_file() {
-        if (fd_ >= 0)
-            ::close(fd_);
-        if (!renamed_)
-            ::unlink(name_.c_str());
-    }
-    int fd() const { return fd_; }
-    bool close() { return ::close(std::exchange(fd_, -1)) == 0; }
-    bool rename_to(const std::string &target) {
-        renamed_ = ::rename(name_.c_str(), target.c_str()) == 0;
-        return renamed_;
-    }
-
-  private:
-    std::string name_;
-    int fd_ = -1;
-    bool renamed_ = false;
-};
 
 } // namespace
 
@@ -158,6 +133,11 @@ void load_buffer_file(const std::string &path, acl_buffer &acl) {
     std::vector<unsigned char> bytes = read_file(path);
     if (bytes.empty())
         throw tool_error(path + " is empty: it is not a compiled ACL buffer");
+    if (bytes[0] != buffer_type_byte)
+        throw tool_error(path +
+                         " is an ACL text file, not a compiled buffer file: compile it "
+                         "first with 'kxacl compile " +
+                         path + " -o BUFFER' and use BUFFER");
     check_status(
         sec_read_acl_from_data(static_cast<kx_int32_t>(bytes.size()), bytes.data(), acl.get()));
     check_status(sec_convert_acl_to_host(1, acl.get()));
@@ -183,6 +163,56 @@ acl_input::acl_input(const invocation &inv, unsigned flags, unsigned *rflags) {
     load_acl(inv, templates, flags, acl, rflags);
 }
 
+staged_file::staged_file(const std::string &target)
+    : target_(target), name_(target + ".kxacl-XXXXXX") {
+    fd_ = ::mkostemp(name_.data(), O_CLOEXEC);
+    if (fd_ < 0)
+        throw tool_error(system_error("cannot create a temporary file for", target));
+}
+
+staged_file::~staged_file() {
+    if (fd_ >= 0)
+        ::close(fd_);
+    if (!renamed_)
+        ::unlink(name_.c_str());
+}
+
+void staged_file::write(const void *data, std::size_t size) {
+    if (!write_all(fd_, data, size))
+        throw tool_error(system_error("cannot write", name_));
+}
+
+void staged_file::give(uid_t uid, gid_t gid, mode_t mode) {
+    struct stat st {};
+    if (::fstat(fd_, &st) != 0)
+        throw tool_error(system_error("cannot read the status of", name_));
+    // Owner first: a change of owner clears the set-id bits.
+    if ((st.st_uid != uid || st.st_gid != gid) && ::fchown(fd_, uid, gid) != 0)
+        throw tool_error(system_error("cannot give the owner " + std::to_string(uid) + ":" +
+                                          std::to_string(gid) + " to",
+                                      name_));
+    if (::fchmod(fd_, mode) != 0)
+        throw tool_error(system_error("cannot set the mode of", name_));
+}
+
+void staged_file::commit() {
+    if (::fsync(fd_) != 0 || ::close(std::exchange(fd_, -1)) != 0)
+        throw tool_error(system_error("cannot write", name_));
+    if (::rename(name_.c_str(), target_.c_str()) != 0)
+        throw tool_error(system_error("cannot rename " + name_ + " to", target_));
+    renamed_ = true;
+}
+
+void sync_directory_of(const std::string &path) {
+    const std::size_t slash = path.rfind('/');
+    const std::string dir = slash == std::string::npos ? "."
+                            : slash == 0               ? "/"
+                                                       : path.substr(0, slash);
+    unique_fd fd(::open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NOCTTY));
+    if (fd.get() < 0 || ::fsync(fd.get()) != 0)
+        throw tool_error(system_error("cannot flush the directory", dir));
+}
+
 void write_buffer_file(const std::string &path, const sec_buffer_s &acl) {
     acl_buffer empty;
     const sec_buffer_s *bytes = &acl;
@@ -191,11 +221,20 @@ void write_buffer_file(const std::string &path, const sec_buffer_s &acl) {
         bytes = &empty.bytes();
     }
     const mode_t mode = mode_for(path);
-    temp_file tmp(path);
-    if (::fchmod(tmp.fd(), mode) != 0 ||
-        !write_all(tmp.fd(), bytes->value, static_cast<std::size_t>(bytes->length)) ||
-        ::fsync(tmp.fd()) != 0 || !tmp.close() || !tmp.rename_to(path))
+    staged_file tmp(path);
+    if (::fchmod(tmp.fd(), mode) != 0)
         throw tool_error(system_error("cannot write", path));
+    tmp.write(bytes->value, static_cast<std::size_t>(bytes->length));
+    tmp.commit();
+}
+
+std::optional<struct stat> file_status(const std::string &path, bool follow) {
+    struct stat st {};
+    if ((follow ? ::stat(path.c_str(), &st) : ::lstat(path.c_str(), &st)) == 0)
+        return st;
+    if (errno == ENOENT)
+        return std::nullopt;
+    throw tool_error(system_error("cannot read the status of", path));
 }
 
 bool is_cache_name(const std::string &path) {

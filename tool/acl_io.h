@@ -4,9 +4,12 @@
 #define KXACL_TOOL_ACL_IO_H
 
 #include <cstdlib>
+#include <optional>
 #include <stdexcept>
 #include <string>
 #include <vector>
+
+#include <sys/stat.h>
 
 #include <kx_acl.h>
 
@@ -74,6 +77,38 @@ bool looks_like_buffer(const std::string &path);
 
 // Reads a buffer file and validates it, bringing it into host byte order.
 void load_buffer_file(const std::string &path, acl_buffer &acl);
+
+// The bytes of a regular file, read whole.
+std::vector<unsigned char> read_file(const std::string &path);
+
+// The status of path (of a symbolic link itself unless follow); nothing
+// when there is no such file.
+std::optional<struct stat> file_status(const std::string &path, bool follow);
+
+// A file written beside its target, target + ".kxacl-XXXXXX", and renamed
+// over it; removed again unless commit() renamed it.
+class staged_file {
+  public:
+    explicit staged_file(const std::string &target);
+    staged_file(const staged_file &) = delete;
+    staged_file &operator=(const staged_file &) = delete;
+    ~staged_file();
+    const std::string &name() const { return name_; }
+    int fd() const { return fd_; }
+    void write(const void *data, std::size_t size);
+    // Gives the file an owner and group (when they differ), then the mode.
+    void give(uid_t uid, gid_t gid, mode_t mode);
+    // Flushes the file to disk, closes it and renames it over the target.
+    void commit();
+
+  private:
+    std::string target_, name_;
+    int fd_ = -1;
+    bool renamed_ = false;
+};
+
+// Flushes the directory that holds path, so that a rename in it lasts.
+void sync_directory_of(const std::string &path);
 
 // Writes an ACL buffer to path through a temporary file in the same folder
 // and a rename, so that readers see the old file or the new one whole. The

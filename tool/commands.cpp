@@ -18,67 +18,13 @@
 #include <kx_cu.h>
 
 #include "acl_io.h"
+#include "cache_state.h"
+#include "entries.h"
 #include "json.h"
 #include "templates.h"
 
 namespace kxtool {
 namespace {
-
-void print(const std::string &text) {
-    std::fwrite(text.data(), 1, text.size(), stdout);
-}
-
-std::string hex_mask(std::uint32_t mask) {
-    char text[16];
-    std::snprintf(text, sizeof text, "0x%08" PRIx32, mask);
-    return text;
-}
-
-unsigned char type_code(char letter) {
-    switch (letter) {
-    case 'n':
-        return SEC_ACLE_UNAUTHENTICATED;
-    case 'o':
-        return SEC_ACLE_ANYOTHER;
-    case 'u':
-        return SEC_ACLE_USER;
-    case 'e':
-        return SEC_ACLE_EXPANDED;
-    case 'g':
-        return SEC_ACLE_GROUP;
-    default:
-        return 0;
-    }
-}
-
-struct type_names {
-    unsigned char code;
-    char letter;
-    const char *name;
-};
-constexpr std::array<type_names, 5> types = {{{SEC_ACLE_UNAUTHENTICATED, 'n', "unauthenticated"},
-                                              {SEC_ACLE_ANYOTHER, 'o', "anyother"},
-                                              {SEC_ACLE_USER, 'u', "user"},
-                                              {SEC_ACLE_EXPANDED, 'e', "expanded"},
-                                              {SEC_ACLE_GROUP, 'g', "group"}}};
-
-const type_names &names_of(unsigned char code) {
-    for (const auto &t : types)
-        if (t.code == code)
-            return t;
-    static constexpr type_names unknown{0, '?', "unknown"};
-    return unknown;
-}
-
-// The permission string of a mask, or nothing when a bit has no template.
-std::optional<std::string> perm_string(std::uint32_t mask, template_set &templates) {
-    char text[33];
-    if (sec_translate_bitmask(mask, templates.get(), text) != SEC_S_OK) {
-        cu_set_no_error_1();
-        return std::nullopt;
-    }
-    return std::string(text);
-}
 
 // Whether arg is written as a mask: decimal digits, or 0x and hex digits.
 bool looks_like_mask(const std::string &arg) {
@@ -109,103 +55,6 @@ std::uint32_t parse_perm_argument(const std::string &arg, perms_mode mode,
     return mask;
 }
 
-// A text that the library allocated, released with free.
-struct owned_text {
-    char *p = nullptr;
-    ~owned_text() { std::free(p); }
-};
-
-// An entry as the listing shows it.
-struct shown_entry {
-    const type_names *type;
-    std::string mech, id;         // the process codeset, for people
-    std::string raw_mech, raw_id; // as stored (UTF-8), for JSON
-    std::optional<std::string> perms;
-    std::uint32_t mask;
-};
-
-shown_entry show(const sec_acle_desc &acle, template_set &templates) {
-    shown_entry e{&names_of(acle.type), {}, {}, acle.mech, acle.id ? acle.id : "", {}, acle.perm};
-    owned_text mech, id;
-    if (sec_display_acle_id(const_cast<sec_acle_t>(&acle), &mech.p, &id.p) == SEC_S_OK) {
-        e.mech = mech.p ? mech.p : "";
-        e.id = id.p ? id.p : "";
-    } else {
-        cu_set_no_error_1();
-        e.mech = e.raw_mech;
-        e.id = e.raw_id;
-    }
-    e.perms = perm_string(acle.perm, templates);
-    return e;
-}
-
-// An entry list that the library filled, released on destruction.
-struct entry_list {
-    sec_acle_list_desc list{0, nullptr};
-    ~entry_list() { sec_release_aclelist(&list); }
-};
-
-std::vector<shown_entry> list_entries(const invocation &inv, acl_buffer &acl,
-                                      template_set &templates) {
-    entry_list entries;
-    if (acl.bytes().length == 0)
-        return {};
-    if (inv.list_type == 0)
-        check_status(sec_list_acl(acl.get(), &entries.list));
-    else
-        check_status(sec_list_acl_by_type(
-            acl.get(), type_code(inv.list_type),
-            inv.list_mech.empty() ? nullptr : const_cast<char *>(inv.list_mech.c_str()),
-            &entries.list));
-    std::vector<shown_entry> shown;
-    shown.reserve(static_cast<std::size_t>(entries.list.count));
-    for (kx_int32_t i = 0; i < entries.list.count; ++i)
-        shown.push_back(show(*entries.list.acles[i], templates));
-    return shown;
-}
-
-void write_entry(json_writer &json, const shown_entry &e) {
-    json.begin_object().key("type").value(e.type->name).key("mech");
-    e.raw_mech.empty() ? json.null() : json.value(e.raw_mech);
-    json.key("id");
-    e.type->code &(SEC_ACLE_UNAUTHENTICATED | SEC_ACLE_ANYOTHER) ? json.null()
-                                                                 : json.value(e.raw_id);
-    json.key("perms");
-    e.perms ? json.value(*e.perms) : json.null();
-    json.key("mask").value(static_cast<std::int64_t>(e.mask)).end_object();
-}
-
-// Lines of ACL text, columns aligned: the listing reads back as an ACL file
-// whenever every mask has templates.
-std::string entry_lines(const std::vector<shown_entry> &entries) {
-    std::vector<std::array<std::string, 4>> rows;
-    std::array<std::size_t, 4> width{};
-    for (const auto &e : entries) {
-        std::array<std::string, 4> row{std::string(1, e.type->letter), e.mech, e.id,
-                                       e.perms ? *e.perms : hex_mask(e.mask)};
-        if (e.type->code == SEC_ACLE_GROUP)
-            row[1].swap(row[2]); // a group has an identity and no mechanism
-        for (std::size_t c = 0; c < row.size(); ++c)
-            width[c] = std::max(width[c], row[c].size());
-        rows.push_back(std::move(row));
-    }
-    std::string out;
-    for (const auto &row : rows) {
-        std::string line;
-        for (std::size_t c = 0; c < row.size(); ++c) {
-            if (row[c].empty())
-                continue;
-            line += row[c];
-            if (c + 1 < row.size())
-                line.append(width[c] - row[c].size() + 1, ' ');
-        }
-        while (!line.empty() && line.back() == ' ')
-            line.pop_back();
-        out += line + "\n";
-    }
-    return out;
-}
-
 // Sub-ACLs hold the entries of one type and mechanism, listed together.
 std::size_t count_subacls(const std::vector<shown_entry> &entries) {
     std::size_t count = 0;
@@ -228,36 +77,46 @@ int run_compile(const invocation &inv) {
     acl_buffer &acl = in.acl;
     if (!inv.output.empty())
         write_buffer_file(inv.output, acl.bytes());
-    const auto entries = list_entries(invocation{}, acl, in.templates);
-    const bool cached = (rflags & SEC_F_ACL_CACHE) != 0;
+    const auto entries = list_entries(acl, in.templates);
+    cache_outcome cache;
+    if (inv.cache)
+        cache = settle_cache(inv.input, inv.owner.empty() ? nullptr : inv.owner.c_str(),
+                             in.templates.get(), rflags, inv.force);
+    if (!cache.problem.empty() && inv.json)
+        throw tool_error(cache.problem);
     if (inv.json) {
         json_writer json;
         json.begin_object().key("file").value(inv.input);
         json.key("entries").value(static_cast<std::int64_t>(entries.size()));
         json.key("subacls").value(static_cast<std::int64_t>(count_subacls(entries)));
         json.key("bytes").value(static_cast<std::int64_t>(acl.bytes().length));
-        json.key("cached").value(cached).key("output");
+        json.key("cached").value(cache.written || cache.current).key("output");
         inv.output.empty() ? json.null() : json.value(inv.output);
+        json.key("note");
+        cache.note.empty() ? json.null() : json.value(cache.note);
         print(json.end_object().str());
         return exit_ok;
     }
     std::string out = inv.input + ": " + std::to_string(entries.size()) + " entries in " +
                       std::to_string(count_subacls(entries)) + " sub-ACLs, " +
                       std::to_string(acl.bytes().length) + " bytes\n";
-    if (cached)
+    if (cache.written)
         out += "cached in " + inv.input + ".cacl\n";
-    else if (inv.cache)
-        out += "not cached (a cached file newer than the text exists, or it could not be "
-               "written)\n";
+    else if (cache.current)
+        out += inv.input + ".cacl is current already\n";
+    if (!cache.note.empty())
+        out += "note: " + cache.note + "\n";
     if (!inv.output.empty())
         out += "written to " + inv.output + "\n";
     print(out);
+    if (!cache.problem.empty())
+        throw tool_error(cache.problem);
     return exit_ok;
 }
 
 int run_list(const invocation &inv) {
     acl_input in(inv, SEC_F_ACL_CONVERT);
-    const auto entries = list_entries(inv, in.acl, in.templates);
+    const auto entries = list_entries(in.acl, in.templates, inv.list_type, inv.list_mech);
     if (!inv.json) {
         print(entry_lines(entries));
         return exit_ok;
@@ -268,42 +127,6 @@ int run_list(const invocation &inv) {
         write_entry(json, e);
     print(json.end_array().end_object().str());
     return exit_ok;
-}
-
-// The stand-in handler of expanded entries: the same identity, byte for
-// byte. The family's daemons register their mechanisms' own handlers.
-kx_int32_t same_identity(char *id, char *acle_id) {
-    return std::strcmp(id, acle_id) == 0 ? 0 : 1;
-}
-
-// The mask that acl grants to the requester; nothing when no entry names it.
-std::optional<std::uint32_t> evaluate(const identity &who, acl_buffer &acl) {
-    if (acl.bytes().length == 0)
-        return std::nullopt;
-    kx_uint32_t mask = 0;
-    int status = SEC_S_OK;
-    auto *mech = const_cast<char *>(who.mech.c_str());
-    if (who.type == 'g') {
-        std::vector<sec_buffer_s> groups;
-        for (const auto &name : who.ids)
-            groups.push_back(
-                {static_cast<kx_int32_t>(name.size() + 1), const_cast<char *>(name.c_str())});
-        status = sec__group_acles_perm(acl.get(), static_cast<kx_int32_t>(groups.size()),
-                                       groups.data(), &mask);
-    } else {
-        if (who.type == 'e')
-            check_status(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mech, same_identity));
-        char *id = who.ids.empty() ? nullptr : const_cast<char *>(who.ids[0].c_str());
-        status = sec__single_acle_perm(acl.get(), type_code(who.type), mech, nullptr, id, &mask);
-    }
-    try {
-        check_status(status);
-    } catch (const library_error &e) {
-        if (e.id == "2650-147") // no entry for the requester
-            return std::nullopt;
-        throw;
-    }
-    return mask;
 }
 
 int run_check(const invocation &inv) {
@@ -417,21 +240,8 @@ int run_dump(const invocation &inv) {
 }
 
 int show_templates(const invocation &inv, template_set &templates) {
-    sec_perm_set_t set = templates.get();
-    std::vector<sec_perm_desc> shown;
-    if (set)
-        shown.assign(set->perms, set->perms + set->count);
-    else
-        for (unsigned bit = 0; bit < 32; ++bit) {
-            char c[33];
-            if (sec_translate_bitmask(1u << bit, nullptr, c) == SEC_S_OK) {
-                sec_perm_desc p{};
-                p.code = 1u << bit;
-                p.printchar = c[0];
-                shown.push_back(p);
-            }
-        }
-    cu_set_no_error_1();
+    const template_set defaults = default_templates();
+    const std::vector<sec_perm_desc> &shown = templates.get() ? templates.perms : defaults.perms;
     json_writer json;
     std::string out;
     json.begin_object().key("templates").begin_array();
@@ -482,6 +292,14 @@ int run_command(const invocation &inv) {
         return run_dump(inv);
     case command::perms:
         return run_perms(inv);
+    case command::explain:
+        return run_explain(inv);
+    case command::lint:
+        return run_lint(inv);
+    case command::diff:
+        return run_diff(inv);
+    case command::install:
+        return run_install(inv);
     case command::none:
         break;
     }

@@ -1,4 +1,5 @@
-// kxacl: compile, check, list, edit and dump ACLs from the command line.
+// kxacl: compile, check, explain, lint, diff, list, edit, dump and install
+// ACLs from the command line.
 #include <cstdio>
 #include <exception>
 #include <new>
@@ -13,15 +14,27 @@ namespace {
 
 using namespace kxtool;
 
+// The kinds of failure, as JSON names them: a command line that is not one
+// (with where to read more), a file or value the tool cannot use, and a
+// failure of the library (with its status and message number).
+enum class failure_kind { usage, tool, library };
+
 // Reports a failure on standard error, and as JSON on standard output when
 // JSON was asked for, so that scripts always get a document to parse.
-int report_failure(bool json, int status, const std::string &id, const std::string &message) {
+int report_failure(bool json, failure_kind kind, const std::string &message,
+                   const library_error *lib = nullptr, const std::string &help = {}) {
     std::fputs(message.c_str(), stderr);
     if (json) {
+        static constexpr const char *kinds[] = {"usage", "tool", "library"};
         json_writer out;
         out.begin_object().key("error").begin_object();
-        out.key("status").value(static_cast<std::int64_t>(status)).key("id");
-        id.empty() ? out.null() : out.value(id);
+        out.key("kind").value(kinds[static_cast<int>(kind)]);
+        if (lib) {
+            out.key("status").value(static_cast<std::int64_t>(lib->status)).key("id");
+            lib->id.empty() ? out.null() : out.value(lib->id);
+        }
+        if (!help.empty())
+            out.key("help").value(help);
         out.key("message").value(message).end_object().end_object();
         std::fputs(out.str().c_str(), stdout);
     }
@@ -31,12 +44,10 @@ int report_failure(bool json, int status, const std::string &id, const std::stri
 int run(int argc, char **argv) {
     const parsed p = parse_command_line(
         std::span<const char *const>(argv + 1, static_cast<std::size_t>(argc > 0 ? argc - 1 : 0)));
-    if (!p.error.empty()) {
-        const std::string where = p.inv.cmd == command::none
-                                      ? "kxacl --help"
-                                      : "kxacl " + std::string(command_name(p.inv.cmd)) + " --help";
-        return report_failure(p.inv.json, 0, {}, "kxacl: " + p.error + "\nTry '" + where + "'.\n");
-    }
+    if (!p.error.empty())
+        return report_failure(p.inv.json, failure_kind::usage,
+                              "kxacl: " + p.error + "\nTry '" + p.help_hint() + "'.\n", nullptr,
+                              p.help_hint());
     if (p.inv.version) {
         std::fputs("kxacl " KXACL_VERSION "\n", stdout);
         return exit_ok;
@@ -48,9 +59,10 @@ int run(int argc, char **argv) {
     try {
         return run_command(p.inv);
     } catch (const library_error &e) {
-        return report_failure(p.inv.json, e.status, e.id, e.what());
+        return report_failure(p.inv.json, failure_kind::library, e.what(), &e);
     } catch (const tool_error &e) {
-        return report_failure(p.inv.json, 0, {}, "kxacl: " + std::string(e.what()) + "\n");
+        return report_failure(p.inv.json, failure_kind::tool,
+                              "kxacl: " + std::string(e.what()) + "\n");
     }
 }
 

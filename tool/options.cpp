@@ -12,23 +12,33 @@ constexpr unsigned bit(command c) {
     return 1u << static_cast<unsigned>(c);
 }
 constexpr unsigned every_command = bit(command::compile) | bit(command::check) |
-                                   bit(command::list) | bit(command::add) | bit(command::del) |
-                                   bit(command::dump) | bit(command::perms);
-constexpr unsigned readers =
-    bit(command::compile) | bit(command::check) | bit(command::list) | bit(command::dump);
-constexpr unsigned selectors = bit(command::check) | bit(command::add) | bit(command::del);
+                                   bit(command::explain) | bit(command::list) | bit(command::lint) |
+                                   bit(command::diff) | bit(command::add) | bit(command::del) |
+                                   bit(command::dump) | bit(command::perms) | bit(command::install);
+// The commands that read ACL text files, which may have to belong to a user.
+constexpr unsigned readers = bit(command::compile) | bit(command::check) | bit(command::explain) |
+                             bit(command::list) | bit(command::lint) | bit(command::diff) |
+                             bit(command::dump);
+// The commands that take a file as text or as a buffer file.
+constexpr unsigned either_kind = readers & ~bit(command::compile);
+constexpr unsigned selectors =
+    bit(command::check) | bit(command::explain) | bit(command::add) | bit(command::del);
 
 struct command_entry {
     const char *name;
     command cmd;
 };
-constexpr std::array<command_entry, 7> commands = {{{"compile", command::compile},
-                                                    {"check", command::check},
-                                                    {"list", command::list},
-                                                    {"add", command::add},
-                                                    {"del", command::del},
-                                                    {"dump", command::dump},
-                                                    {"perms", command::perms}}};
+constexpr std::array<command_entry, 11> commands = {{{"compile", command::compile},
+                                                     {"check", command::check},
+                                                     {"explain", command::explain},
+                                                     {"list", command::list},
+                                                     {"lint", command::lint},
+                                                     {"diff", command::diff},
+                                                     {"add", command::add},
+                                                     {"del", command::del},
+                                                     {"dump", command::dump},
+                                                     {"perms", command::perms},
+                                                     {"install", command::install}}};
 
 // The state of one parse: the arguments still to read and the result.
 struct parser {
@@ -56,27 +66,47 @@ struct parser {
         value = args[next++];
         return true;
     }
-    void set_identity(char type, std::string_view opt) {
-        if (out.inv.who.type != 0 && !(type == 'g' && out.inv.who.type == 'g'))
-            return fail("give one of --unauthenticated, --anyother, --user, --expanded, --group");
-        out.inv.who.type = type;
-        if (type == 'u' || type == 'e') {
-            std::string mech, id;
-            if (!take_value(opt, std::nullopt, mech) || !take_value(opt, std::nullopt, id))
-                return;
-            out.inv.who.mech = mech;
-            out.inv.who.ids = {id};
+    // The identity that an option starts: the one of check, add and del, or
+    // one more of the requester that explain describes.
+    identity *start_identity(char type) {
+        invocation &inv = out.inv;
+        if (inv.cmd != command::explain) {
+            if (inv.who.type != 0 && !(type == 'g' && inv.who.type == 'g')) {
+                fail("give one of --unauthenticated, --anyother, --user, --expanded, --group");
+                return nullptr;
+            }
+            inv.who.type = type;
+            return &inv.who;
         }
+        for (auto &asked : inv.asks)
+            if (asked.type == type) {
+                if (type == 'g')
+                    return &asked;
+                fail("explain takes each of --unauthenticated, --anyother, --user and "
+                     "--expanded once");
+                return nullptr;
+            }
+        return &inv.asks.emplace_back(identity{type, {}, {}});
+    }
+    void set_identity(char type, std::string_view opt) {
+        identity *who = start_identity(type);
+        if (who == nullptr || (type != 'u' && type != 'e'))
+            return;
+        std::string mech, id;
+        if (!take_value(opt, std::nullopt, mech) || !take_value(opt, std::nullopt, id))
+            return;
+        who->mech = mech;
+        who->ids = {id};
     }
     // --group NAME...: every following argument up to the next option.
     void take_groups(const std::optional<std::string_view> &inline_value) {
-        set_identity('g', "--group");
+        identity *who = start_identity('g');
         std::string name;
-        if (failed() || !take_value("--group", inline_value, name))
+        if (who == nullptr || !take_value("--group", inline_value, name))
             return;
-        out.inv.who.ids.push_back(name);
+        who->ids.push_back(name);
         while (next < args.size() && args[next][0] != '-')
-            out.inv.who.ids.emplace_back(args[next++]);
+            who->ids.emplace_back(args[next++]);
     }
 };
 
@@ -109,26 +139,38 @@ constexpr std::array option_table =
                      [](parser &p, auto, auto &) { p.out.inv.json = true; }},
         option_entry{"--templates", every_command, false, arity::value,
                      [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.templates); }},
-        option_entry{"--owner", readers, false, arity::value,
+        option_entry{"--owner", readers | bit(command::install), false, arity::value,
                      [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.owner); }},
-        option_entry{"--cache", bit(command::compile), false, arity::flag,
+        option_entry{"--cache", bit(command::compile) | bit(command::install), false, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.cache = true; }},
+        option_entry{"--force", bit(command::compile), false, arity::flag,
+                     [](parser &p, auto, auto &) { p.out.inv.force = true; }},
+        option_entry{"--mode", bit(command::install), false, arity::value,
+                     [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.mode); }},
+        option_entry{"--grants-more", bit(command::diff), false, arity::flag,
+                     [](parser &p, auto, auto &) { p.out.inv.grants_more = true; }},
+        option_entry{"--read-like", bit(command::lint), false, arity::value,
+                     [](parser &p, auto o, auto &v) {
+                         std::string perms;
+                         if (p.take_value(o, v, perms))
+                             p.out.inv.read_like = perms;
+                     }},
         option_entry{"-o", bit(command::compile) | bit(command::add) | bit(command::del), false,
                      arity::value,
                      [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.output); }},
         option_entry{"--output", bit(command::compile) | bit(command::add) | bit(command::del),
                      false, arity::value,
                      [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.output); }},
-        option_entry{"--text", bit(command::check) | bit(command::list) | bit(command::dump), false,
-                     arity::flag,
-                     [](parser &p, auto, auto &) { p.out.inv.kind = input_kind::text; }},
-        option_entry{"--buffer", bit(command::check) | bit(command::list) | bit(command::dump),
-                     false, arity::flag,
-                     [](parser &p, auto, auto &) { p.out.inv.kind = input_kind::buffer; }},
-        option_entry{"--unauthenticated", selectors, false, arity::flag,
-                     [](parser &p, auto o, auto &) { p.set_identity('n', o); }},
-        option_entry{"--anyother", selectors, false, arity::flag,
-                     [](parser &p, auto o, auto &) { p.set_identity('o', o); }},
+        option_entry{
+            "--text", either_kind, false, arity::flag,
+            [](parser &p, auto, auto &) { p.out.inv.kind = input_kind::text; }},
+        option_entry{
+            "--buffer", either_kind, false, arity::flag,
+            [](parser &p, auto, auto &) { p.out.inv.kind = input_kind::buffer; }},
+        option_entry{"--unauthenticated", selectors, false,
+                     arity::flag, [](parser &p, auto o, auto &) { p.set_identity('n', o); }},
+        option_entry{"--anyother", selectors, false,
+                     arity::flag, [](parser &p, auto o, auto &) { p.set_identity('o', o); }},
         option_entry{"--expanded", selectors, false,
                      arity::flag, [](parser &p, auto o, auto &) { p.set_identity('e', o); }},
         option_entry{"--group", selectors, false, arity::value,
@@ -146,22 +188,21 @@ constexpr std::array option_table =
                          if (p.out.inv.list_type == 0)
                              p.fail("unknown entry type '" + s + "'");
                      }},
-        option_entry{"--mech", bit(command::list), false, arity::value,
-                     [](parser &p, auto o, auto &v) { take_string(p, o, v, p.out.inv.list_mech); }},
+        option_entry{"--mech", bit(command::list) | bit(command::lint), false, arity::value,
+                     [](parser &p, auto o, auto &v) {
+                         std::string mech;
+                         if (!p.take_value(o, v, mech))
+                             return;
+                         if (p.out.inv.cmd == command::lint)
+                             p.out.inv.known_mechs.push_back(mech);
+                         else
+                             p.out.inv.list_mech = mech;
+                     }},
         option_entry{"--string", bit(command::perms), false, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::string; }},
         option_entry{"--mask", bit(command::perms), false, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::mask; }},
 };
-
-// --user is two options in one: the file's owner for compile, a requester
-// or an entry (MECH ID) for the commands that take an identity.
-void handle_user(parser &p, std::string_view opt, const std::optional<std::string_view> &v) {
-    if (p.out.inv.cmd == command::compile)
-        p.take_value(opt, v, p.out.inv.owner);
-    else
-        p.set_identity('u', opt);
-}
 
 void handle_option(parser &p, std::string_view arg) {
     std::optional<std::string_view> inline_value;
@@ -171,11 +212,13 @@ void handle_option(parser &p, std::string_view arg) {
         inline_value = arg.substr(eq + 1);
     }
     const command cmd = p.out.inv.cmd;
-    if (name == "--user" && (cmd == command::compile || (bit(cmd) & selectors))) {
-        if (inline_value && cmd != command::compile)
+    if (name == "--user" && (bit(cmd) & selectors)) {
+        if (inline_value)
             return p.fail("option --user takes MECH ID as two arguments");
-        return handle_user(p, name, inline_value);
+        return p.set_identity('u', name);
     }
+    if (name == "--user" && (bit(cmd) & (readers | bit(command::install))))
+        return p.fail("--user names a requester; the owner of the file is --owner NAME");
     const auto found = std::find_if(option_table.begin(), option_table.end(),
                                     [&](const option_entry &o) { return name == o.name; });
     const bool allowed = found != option_table.end() &&
@@ -205,17 +248,24 @@ void finish(parser &p) {
         return;
     if (inv.cmd == command::none)
         return p.fail("no command given");
-    // Every command takes one file or value; only perms may go without.
-    const bool optional_arg = inv.cmd == command::perms;
-    if (p.positionals.size() > 1)
-        return p.fail("unexpected argument '" + p.positionals[1] + "'");
-    if (p.positionals.empty() && !optional_arg)
-        return p.fail(std::string(command_name(inv.cmd)) + " needs a file");
+    // diff and install take two files, perms one value or none, every other
+    // command one file.
+    const bool two_files = inv.cmd == command::diff || inv.cmd == command::install;
+    const std::size_t wanted = two_files ? 2 : 1;
+    if (p.positionals.size() > wanted)
+        return p.fail("unexpected argument '" + p.positionals[wanted] + "'");
+    if (p.positionals.size() < wanted && inv.cmd != command::perms)
+        return p.fail(std::string(command_name(inv.cmd)) +
+                      (inv.cmd == command::diff      ? " needs two files, OLD and NEW"
+                       : inv.cmd == command::install ? " needs two files, SRC and DEST"
+                                                     : " needs a file"));
     if (!p.positionals.empty())
         (inv.cmd == command::perms ? inv.perms_arg : inv.input) = p.positionals[0];
+    if (two_files)
+        inv.second = p.positionals[1];
     if (inv.cmd == command::perms && p.positionals.empty() && inv.perms_as != perms_mode::detect)
         return p.fail("--string and --mask need an argument");
-    if ((bit(inv.cmd) & selectors) && inv.who.type == 0)
+    if ((bit(inv.cmd) & selectors) && inv.cmd != command::explain && inv.who.type == 0)
         return p.fail(std::string(command_name(inv.cmd)) +
                       " needs one of --unauthenticated, --anyother, --user, --expanded, --group");
     if (inv.cmd != command::check && inv.who.ids.size() > 1)
@@ -224,6 +274,8 @@ void finish(parser &p) {
         return p.fail("--mech needs --type user or --type expanded");
     if (!inv.owner.empty() && inv.kind == input_kind::buffer)
         return p.fail("--owner applies to ACL text files, not to buffers");
+    if (inv.force && !inv.cache)
+        return p.fail("--force goes with --cache");
 }
 
 } // namespace
@@ -248,6 +300,11 @@ parsed parse_command_line(std::span<const char *const> args) {
     if (!p.failed())
         finish(p);
     return std::move(p.out);
+}
+
+std::string parsed::help_hint() const {
+    return inv.cmd == command::none ? "kxacl --help"
+                                    : "kxacl " + std::string(command_name(inv.cmd)) + " --help";
 }
 
 const char *command_name(command cmd) {

@@ -11,7 +11,20 @@
 
 namespace kxtool {
 
-enum class command { none, compile, check, list, add, del, dump, perms };
+enum class command {
+    none,
+    compile,
+    check,
+    explain,
+    list,
+    lint,
+    diff,
+    add,
+    del,
+    dump,
+    perms,
+    install
+};
 
 // How an input file is taken: by its first byte, or as the user says.
 enum class input_kind { detect, text, buffer };
@@ -33,19 +46,26 @@ struct invocation {
     bool version = false;
     bool json = false;
 
-    std::string input;     // the ACL file or buffer file
-    std::string owner;     // the user who must own the ACL file
+    std::string input;     // the ACL file or buffer file; diff: OLD; install: SRC
+    std::string second;    // diff: NEW; install: DEST
+    std::string owner;     // the user who owns the ACL file (install: gives it)
     std::string templates; // a permission template file
     std::string output;    // -o: where a buffer is written
     input_kind kind = input_kind::detect;
 
-    bool cache = false;    // compile: write the cached compiled file
-    bool add_only = false; // add: an existing entry is a failure
+    bool cache = false;       // compile, install: write the cached compiled file
+    bool force = false;       // compile: rewrite a cached file newer than the text
+    bool add_only = false;    // add: an existing entry is a failure
+    bool grants_more = false; // diff: exit 1 when NEW grants more than OLD
+    std::string mode;         // install: the permission bits, in octal
 
-    identity who;          // check, add, del
-    std::string perm;      // add: the permissions of the entry
-    char list_type = 0;    // list: only this type
-    std::string list_mech; // list: only this mechanism
+    identity who;                         // check, add, del
+    std::vector<identity> asks;           // explain: the requester's identities
+    std::vector<std::string> known_mechs; // lint: mechanisms besides the usual ones
+    std::optional<std::string> read_like; // lint: what unauthenticated entries may grant
+    std::string perm;                     // add: the permissions of the entry
+    char list_type = 0;                   // list: only this type
+    std::string list_mech;                // list: only this mechanism
 
     std::string perms_arg; // perms: a permission string or a mask
     perms_mode perms_as = perms_mode::detect;
@@ -55,6 +75,8 @@ struct invocation {
 struct parsed {
     invocation inv;
     std::string error; // empty on success
+    // Where to read more: "kxacl --help" or "kxacl COMMAND --help".
+    std::string help_hint() const;
 };
 
 // Parses argv[1..]; args excludes the program name.

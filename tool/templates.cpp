@@ -74,7 +74,42 @@ std::string parse_line(std::string_view line, const std::vector<sec_perm_desc> &
     return {};
 }
 
+// The default set of the library, position by position (bit 0 upwards).
+struct default_template {
+    char printchar;
+    const char *name, *help;
+};
+constexpr default_template default_set[] = {
+    {'r', "read", "general purpose read operation"},
+    {'w', "write", "general purpose write operation"},
+    {'c', "control", "general purpose control operation"},
+    {'x', "execute", "general purpose execute operation"},
+    {'C', "cancel", "general purpose cancel operation"},
+    {'q', "query", "QBT query resource"},
+    {'l', "list", "QBT enumerate resource"},
+    {'e', "event", "QBT event registration/unregistration/quering"},
+    {'d', "define", "QBT define/undefine resource"},
+    {'v', "validate", "QBT validate resource handle"},
+    {'s', "set", "QBT set attribute"},
+    {'a', "set", "QBT administrative control"},
+    {'o', "set", "QBT online/offline/reset resource"},
+};
+
 } // namespace
+
+template_set default_templates() {
+    template_set set;
+    unsigned bit = 0;
+    for (const auto &t : default_set) {
+        sec_perm_desc perm{};
+        perm.code = 1u << bit++;
+        perm.printchar = t.printchar;
+        std::strncpy(perm.printstring, t.name, max_name);
+        std::strncpy(perm.printhelp, t.help, max_help);
+        set.perms.push_back(perm);
+    }
+    return set;
+}
 
 sec_perm_set_t template_set::get() {
     if (perms.empty())

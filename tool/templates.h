@@ -29,6 +29,10 @@ struct template_set {
     sec_perm_set_t get();
 };
 
+// The library's default templates with their names and help texts, for
+// listing: the library itself is handed NULL for them.
+template_set default_templates();
+
 // Parses the text of a template file into set. On failure returns false
 // and describes the first bad line in error as "line N: reason".
 bool parse_templates(std::string_view text, template_set &set, std::string &error);

@@ -25,8 +25,8 @@ TEST(CommandLine, GroupNamesRunToTheNextOption) {
     EXPECT_EQ(parse({"add", "buf", "--group", "a", "b"}).error, "--group takes one name here");
 }
 
-TEST(CommandLine, UserIsTheOwnerForCompileAndARequesterElsewhere) {
-    parsed p = parse({"compile", "f", "--user", "bob", "--cache", "-o", "out"});
+TEST(CommandLine, OwnerIsTheFileOwnerAndUserARequester) {
+    parsed p = parse({"compile", "f", "--owner", "bob", "--cache", "-o", "out"});
     ASSERT_EQ(p.error, "");
     EXPECT_EQ(p.inv.owner, "bob");
     EXPECT_TRUE(p.inv.cache);
@@ -39,6 +39,19 @@ TEST(CommandLine, UserIsTheOwnerForCompileAndARequesterElsewhere) {
     EXPECT_EQ(p.inv.who.ids, std::vector<std::string>{"bob@h"});
     EXPECT_EQ(parse({"check", "f", "--user=unix"}).error,
               "option --user takes MECH ID as two arguments");
+    // explain takes a whole requester; diff and install two files.
+    p = parse({"explain", "f", "--group", "a", "--user", "unix", "u@h", "--group", "b",
+               "--expanded", "unix", "x"});
+    ASSERT_EQ(p.error, "");
+    ASSERT_EQ(p.inv.asks.size(), 3u);
+    EXPECT_EQ(p.inv.asks[0].ids, (std::vector<std::string>{"a", "b"}));
+    EXPECT_EQ(p.inv.asks[2].type, 'e');
+    p = parse({"install", "src", "dest", "--owner", "root", "--mode", "0640", "--cache"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(p.inv.input + " " + p.inv.second + " " + p.inv.mode, "src dest 0640");
+    p = parse({"lint", "f", "--mech", "sso", "--mech=ldap", "--read-like", "r"});
+    EXPECT_EQ(p.inv.known_mechs, (std::vector<std::string>{"sso", "ldap"}));
+    EXPECT_EQ(p.inv.read_like, "r");
 }
 
 TEST(CommandLine, ValuesInlineOrSeparateAndDashDash) {
@@ -74,6 +87,14 @@ TEST(CommandLine, MistakesAreNamed) {
         {{"del", "a", "--json=yes", "--anyother"}, "option --json takes no value"},
         {{"perms", "--mask"}, "--string and --mask need an argument"},
         {{"frob"}, "unknown command 'frob'"},
+        {{"compile", "a", "--user", "bob"},
+         "--user names a requester; the owner of the file is --owner NAME"},
+        {{"compile", "a", "--force"}, "--force goes with --cache"},
+        {{"diff", "a"}, "diff needs two files, OLD and NEW"},
+        {{"install", "a", "b", "c"}, "unexpected argument 'c'"},
+        {{"explain", "a", "--anyother", "--anyother"},
+         "explain takes each of --unauthenticated, --anyother, --user and --expanded once"},
+        {{"diff", "a", "b", "--grants-more", "--cache"}, "unknown option --cache for diff"},
     };
     for (const auto &[args, error] : cases)
         EXPECT_EQ(parse(args).error, error);

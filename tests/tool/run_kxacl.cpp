@@ -1,37 +1,49 @@
 #include "run_kxacl.h"
 
 #include <fcntl.h>
-#include <spawn.h>
+#include <grp.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include "file_helpers.h"
 
-extern char **environ;
-
 namespace kxtest {
+namespace {
 
-run_result run_kxacl(const std::vector<std::string> &args) {
+// In the child: standard output and error to the files, the user, the program.
+[[noreturn]] void exec_kxacl(const std::string &out, const std::string &err,
+                             std::vector<char *> &argv, uid_t uid, gid_t gid) {
+    const int o = ::open(out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0666);
+    const int e = ::open(err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0666);
+    if (o < 0 || e < 0 || ::dup2(o, 1) < 0 || ::dup2(e, 2) < 0)
+        ::_exit(127);
+    if (uid != static_cast<uid_t>(-1) &&
+        (::setgroups(0, nullptr) != 0 || ::setgid(gid) != 0 || ::setuid(uid) != 0))
+        ::_exit(126);
+    ::execv(KXACL_EXE, argv.data());
+    ::_exit(127);
+}
+
+} // namespace
+
+run_result run_kxacl(const std::vector<std::string> &args, uid_t uid, gid_t gid) {
     const std::string dir = temp_dir();
     const removed_at_end cleanup{dir};
     const std::string out = dir + "/out", err = dir + "/err";
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 1, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
-    posix_spawn_file_actions_addopen(&actions, 2, err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
     std::vector<char *> argv{const_cast<char *>(KXACL_EXE)};
     for (const auto &a : args)
         argv.push_back(const_cast<char *>(a.c_str()));
     argv.push_back(nullptr);
-    pid_t pid = 0;
     run_result r;
-    if (posix_spawn(&pid, KXACL_EXE, &actions, nullptr, argv.data(), environ) == 0) {
-        int status = 0;
+    const pid_t pid = ::fork();
+    if (pid == 0)
+        exec_kxacl(out, err, argv, uid, gid);
+    int status = 0;
+    if (pid > 0) {
         while (::waitpid(pid, &status, 0) < 0) {
         }
         r.exit_code = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
     }
-    posix_spawn_file_actions_destroy(&actions);
     r.out = read_file(out);
     r.err = read_file(err);
     return r;

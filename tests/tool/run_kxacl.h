@@ -5,6 +5,8 @@
 #include <string>
 #include <vector>
 
+#include <sys/types.h>
+
 namespace kxtest {
 
 struct run_result {
@@ -12,7 +14,10 @@ struct run_result {
     std::string out, err;
 };
 
-run_result run_kxacl(const std::vector<std::string> &args);
+// Runs kxacl with args; as the user uid (and its group gid) when uid is not
+// -1, which needs root.
+run_result run_kxacl(const std::vector<std::string> &args, uid_t uid = static_cast<uid_t>(-1),
+                     gid_t gid = static_cast<gid_t>(-1));
 
 } // namespace kxtest
 

@@ -1,0 +1,7 @@
+#include "commands.h"
+#include "acl_io.h"
+namespace kxtool {
+int run_diff(const invocation &) {
+    throw tool_error("not yet");
+}
+} // namespace kxtool

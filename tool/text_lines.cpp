@@ -1,0 +1,1 @@
+#include "acl_io.h"
