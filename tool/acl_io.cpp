@@ -143,11 +143,14 @@ void load_buffer_file(const std::string &path, acl_buffer &acl) {
     check_status(sec_convert_acl_to_host(1, acl.get()));
 }
 
+bool is_buffer_input(const invocation &inv) {
+    return inv.kind == input_kind::buffer ||
+           (inv.kind == input_kind::detect && looks_like_buffer(inv.input));
+}
+
 void load_acl(const invocation &inv, template_set &templates, unsigned flags, acl_buffer &acl,
               unsigned *rflags) {
-    const bool buffer = inv.kind == input_kind::buffer ||
-                        (inv.kind == input_kind::detect && looks_like_buffer(inv.input));
-    if (buffer)
+    if (is_buffer_input(inv))
         return load_buffer_file(inv.input, acl);
     kx_uint32_t out_flags = 0;
     const int status =

@@ -75,6 +75,10 @@ void load_acl(const invocation &inv, template_set &templates, unsigned flags, ac
 // Whether the file starts like a compiled ACL buffer.
 bool looks_like_buffer(const std::string &path);
 
+// Whether inv.input is taken as a buffer file: as the user says, or by its
+// first byte.
+bool is_buffer_input(const invocation &inv);
+
 // Reads a buffer file and validates it, bringing it into host byte order.
 void load_buffer_file(const std::string &path, acl_buffer &acl);
 

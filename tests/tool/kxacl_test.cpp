@@ -3,6 +3,8 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <random>
+
 #include <sys/stat.h>
 
 #include "file_helpers.h"
@@ -172,6 +174,167 @@ TEST_F(KxaclTool, CheckPrintsTheGrantAndExitsByIt) {
     }
     const json j = parsed(run_kxacl({"check", acl, "--json", "--user", "unix", "joe"}));
     EXPECT_EQ(j, json::parse(R"({"entry":true,"granted":false,"perms":"","mask":0})"));
+}
+
+// The answers of explain against those of check and of the library's own
+// evaluation, over random ACLs and requesters; and each deciding entry
+// against the line that was written for it.
+kx_int32_t byte_equal(char *id, char *acle_id) {
+    return std::strcmp(id, acle_id) == 0 ? 0 : 1;
+}
+
+struct random_acl {
+    std::string text;
+    std::vector<std::pair<std::string, std::string>> line_ids; // per line: type and identity
+};
+
+random_acl make_acl(std::mt19937 &rng) {
+    const auto coin = [&] { return rng() % 2 == 0; };
+    const auto perms = [&] {
+        std::string p;
+        for (const char c : std::string("rwxq"))
+            if (coin())
+                p += c;
+        return p;
+    };
+    random_acl acl;
+    const auto add = [&](const std::string &type, const std::string &mech, const std::string &id) {
+        acl.text += type.substr(0, 1) + (mech.empty() ? "" : " " + mech) +
+                    (id.empty() ? "" : " " + id) + " " + perms() + "\n";
+        acl.line_ids.emplace_back(type, id);
+    };
+    if (coin())
+        add("n", "", "");
+    if (coin())
+        add("o", "", "");
+    for (const char *mech : {"unix", "krb5"})
+        for (const char *user : {"ann@h1", "Bob@h1", "carl@h2", "dora@h2"})
+            if (coin())
+                add("user", mech, user);
+    for (const char *group : {"adm", "Staff", "web"})
+        if (coin())
+            add("group", "", group);
+    for (const char *id : {"uid=1@h1", "uid=2@h1"})
+        if (coin())
+            add("expanded", "unix", id);
+    return acl;
+}
+
+std::string flip_case(std::mt19937 &rng, std::string s) {
+    for (char &c : s)
+        if (std::isalpha(static_cast<unsigned char>(c)) && rng() % 3 == 0)
+            c = static_cast<char>(c ^ 0x20);
+    return s;
+}
+
+// The library's answer: the mask, or -1 when no entry names the requester.
+std::int64_t library_answer(sec_buffer_s &acl, const json &a) {
+    kx_uint32_t mask = 0;
+    kx_int32_t status;
+    const std::string question = a["question"];
+    std::vector<std::string> ids = a["ids"];
+    if (question == "group" || question == "groups") {
+        std::vector<sec_buffer_s> groups;
+        for (auto &id : ids)
+            groups.push_back({static_cast<kx_int32_t>(id.size() + 1), id.data()});
+        status = sec__group_acles_perm(&acl, static_cast<kx_int32_t>(groups.size()), groups.data(),
+                                       &mask);
+    } else {
+        const unsigned char type = question == "user"       ? 4
+                                   : question == "expanded" ? 8
+                                   : question == "anyother" ? 2
+                                                            : 1;
+        std::string mech = a["mech"].is_null() ? "" : a["mech"].get<std::string>();
+        status = sec__single_acle_perm(&acl, type, mech.data(), nullptr,
+                                       ids.empty() ? nullptr : ids[0].data(), &mask);
+    }
+    return status == SEC_S_OK ? std::int64_t{mask} : status == SEC_S_BAD_ACLE ? -1 : -2;
+}
+
+std::vector<std::string> check_args(const json &a) {
+    const std::string question = a["question"];
+    if (question == "user" || question == "expanded")
+        return {"--" + question, a["mech"], a["ids"][0]};
+    if (question == "group" || question == "groups") {
+        std::vector<std::string> args{"--group"};
+        for (const auto &id : a["ids"])
+            args.push_back(id);
+        return args;
+    }
+    return {"--" + question};
+}
+
+TEST_F(KxaclTool, ExplainAnswersAsCheckAndTheLibraryDo) {
+    std::mt19937 rng(17);
+    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", byte_equal), 0);
+    int decided = 0, undecided = 0;
+    for (int round = 0; round < 16; ++round) {
+        const random_acl made = make_acl(rng);
+        kxtest::write_file(acl, made.text);
+        const char *users[] = {"ann@h1", "bob@h1", "carl@h2", "eve@h1"};
+        const char *groups[] = {"adm", "staff", "web", "zzz"};
+        const std::string mech = rng() % 2 ? "unix" : "KRB5";
+        const json j = parsed(
+            run_kxacl({"explain", acl, "--json", "--user", mech, flip_case(rng, users[rng() % 4]),
+                       "--expanded", "unix", rng() % 2 ? "uid=1@h1" : "UID=2@h1", "--group",
+                       flip_case(rng, groups[rng() % 4]), flip_case(rng, groups[rng() % 4])}));
+        kxtest::acl_read lib(acl, SEC_F_ACL_TEXT);
+        ASSERT_EQ(lib.status, 0) << made.text;
+        ASSERT_EQ(j["answers"].size(), 7u) << j;
+        for (const json &a : j["answers"]) {
+            std::vector<std::string> args{"check", acl, "--json"};
+            for (const auto &arg : check_args(a))
+                args.push_back(arg);
+            const json c = parsed(run_kxacl(args));
+            SCOPED_TRACE(made.text + a.dump());
+            EXPECT_EQ(c["entry"], a["entry"]);
+            EXPECT_EQ(c["mask"], a["mask"]);
+            EXPECT_EQ(library_answer(lib.acl, a), a["entry"] ? a["mask"].get<std::int64_t>() : -1);
+            if (a["decided_by"].is_null()) {
+                undecided += a["entry"] ? 0 : 1;
+                EXPECT_NE(a["why"].is_null(), !a["entry"] && a["question"] != "groups");
+                continue;
+            }
+            ++decided;
+            const json &d = a["decided_by"];
+            EXPECT_EQ(d["entry"]["mask"], a["mask"]);
+            const auto &[type, id] = made.line_ids.at(d["line"].get<std::size_t>() - 1);
+            if (type.size() > 1) { // the anyother and unauthenticated lines are n and o
+                EXPECT_EQ(type, d["entry"]["type"]);
+                EXPECT_EQ(id, d["entry"]["id"]);
+            }
+        }
+    }
+    // Both kinds of answer came up.
+    EXPECT_GT(decided, 20);
+    EXPECT_GT(undecided, 20);
+}
+
+TEST_F(KxaclTool, ExplainShowsTheDecidingLineOrWhyNoneApplied) {
+    const std::string buf = compiled();
+    auto r = run_kxacl({"explain", acl, "--user", "unix", "ROOT", "--group", "staff", "aaa",
+                        "--expanded", "unix", "JOE"});
+    ASSERT_EQ(r.exit_code, 0) << r.err;
+    EXPECT_EQ(r.out, "user unix ROOT: rwcx 0x0000000f\n"
+                     "  decided by line 5: u unix root rwcx\n"
+                     "expanded unix JOE: no entry\n"
+                     "  no expanded entry of mechanism unix is JOE byte for byte (1 compared by "
+                     "kxacl's stand-in for the mechanism's handler)\n"
+                     "group staff: rw 0x00000003\n"
+                     "  decided by line 7: g staff rw\n"
+                     "group aaa: no entry\n"
+                     "  no group entry names aaa: aaa sorts before admin (line 8), where the walk "
+                     "stops\n"
+                     "groups staff aaa: rw 0x00000003\n"
+                     "anyother: r 0x00000001\n"
+                     "  decided by line 4: o r\n"
+                     "unauthenticated: - 0x00000000\n"
+                     "  decided by line 3: n\n");
+    // A buffer file has positions instead of lines; no user entry of krb5.
+    r = run_kxacl({"explain", buf, "--user", "krb5", "root"});
+    EXPECT_EQ(r.out.substr(0, r.out.find("anyother")), "user krb5 root: no entry\n"
+                                                       "  no user entry of mechanism krb5\n");
+    EXPECT_NE(r.out.find("  decided by entry 6: o r\n"), std::string::npos) << r.out;
 }
 
 TEST_F(KxaclTool, CheckReadsThroughACurrentCachedFile) {
