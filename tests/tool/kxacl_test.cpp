@@ -337,6 +337,47 @@ TEST_F(KxaclTool, ExplainShowsTheDecidingLineOrWhyNoneApplied) {
     EXPECT_NE(r.out.find("  decided by entry 6: o r\n"), std::string::npos) << r.out;
 }
 
+TEST_F(KxaclTool, DiffShowsEachEntrysChangeAndGatesOnGrantingMore) {
+    struct {
+        const char *old_text, *new_text, *out;
+        int grants_more;
+    } cases[] = {
+        {"o r\n", "O r # same\n", "no entry differs\n", 0},
+        {"u unix Ann@h rw\n", "u unix ann@H rw\n", "no entry differs\n", 0},
+        {"g web rw\n", "g web r\n", "narrowed: g web rw -> r (-w)\n", 0},
+        {"g web r\n", "g web rwx\n", "widened:  g web r -> rwx (+wx); grants more: wx\n", 1},
+        {"n r\n", "n w\n", "changed:  n r -> w (+w -r); grants more: w\n", 1},
+        {"o r\n", "o r\nu unix a@h\n", "added:    u unix a@h -\n", 0},
+        {"o r\n", "o r\ng web q\n", "added:    g web q; grants more: q\n", 1},
+        {"e unix x r\n", "e unix X r\n",
+         "removed:  e unix x r\nadded:    e unix X r; grants more: r\n", 1},
+        {"o r\nu unix a@h rw\n", "o r\n", "removed:  u unix a@h rw\n", 0},
+        {"o rw\nu unix a@h r\n", "o rw\n",
+         "removed:  u unix a@h r; its requesters fall back to the anyother entry, which grants "
+         "more: w\n",
+         1},
+        {"n r\n", "\n", "removed:  n r\n", 0},
+    };
+    const std::string old_acl = dir + "/old.acl", new_acl = dir + "/new.acl";
+    for (const auto &c : cases) {
+        kxtest::write_file(old_acl, c.old_text);
+        kxtest::write_file(new_acl, c.new_text);
+        auto r = run_kxacl({"diff", old_acl, new_acl});
+        EXPECT_EQ(r.exit_code, 0) << r.err;
+        EXPECT_EQ(r.out, c.out) << c.old_text << "->" << c.new_text;
+        EXPECT_EQ(run_kxacl({"diff", old_acl, new_acl, "--grants-more"}).exit_code, c.grants_more)
+            << c.old_text << "->" << c.new_text;
+    }
+    // A buffer file against a text, as JSON.
+    kxtest::write_file(new_acl, "g admin rwcxCqledvsao\ng staff rwx\n");
+    const json j = parsed(run_kxacl({"diff", compiled(), new_acl, "--json", "--grants-more"}));
+    ASSERT_EQ(j["changes"].size(), 6u) << j; // n, o, two users and the expanded entry removed
+    EXPECT_EQ(j["changes"][1], json::parse(R"({"change":"widened","entry":{"type":"group",
+        "mech":null,"id":"staff","perms":"rwx","mask":11},"old":{"perms":"rw","mask":3},
+        "new":{"perms":"rwx","mask":11},"grants_more":{"perms":"x","mask":8}})"));
+    EXPECT_EQ(j["grants_more"], true);
+}
+
 TEST_F(KxaclTool, CheckReadsThroughACurrentCachedFile) {
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
     // A current cached file is believed without reading the text: give it
