@@ -198,12 +198,16 @@ void staged_file::give(uid_t uid, gid_t gid, mode_t mode) {
         throw tool_error(system_error("cannot set the mode of", name_));
 }
 
-void staged_file::commit() {
-    if (::fsync(fd_) != 0 || ::close(std::exchange(fd_, -1)) != 0)
+void staged_file::commit(bool touch_after) {
+    if (::fsync(fd_) != 0)
         throw tool_error(system_error("cannot write", name_));
     if (::rename(name_.c_str(), target_.c_str()) != 0)
         throw tool_error(system_error("cannot rename " + name_ + " to", target_));
     renamed_ = true;
+    if (touch_after && ::futimens(fd_, nullptr) != 0)
+        throw tool_error(system_error("cannot set the modification time of", target_));
+    if (::close(std::exchange(fd_, -1)) != 0)
+        throw tool_error(system_error("cannot write", target_));
 }
 
 void sync_directory_of(const std::string &path) {

@@ -102,8 +102,10 @@ class staged_file {
     void write(const void *data, std::size_t size);
     // Gives the file an owner and group (when they differ), then the mode.
     void give(uid_t uid, gid_t gid, mode_t mode);
-    // Flushes the file to disk, closes it and renames it over the target.
-    void commit();
+    // Flushes the file to disk, renames it over the target and closes it;
+    // with touch_after, gives it the time after the rename as its
+    // modification time first.
+    void commit(bool touch_after = false);
 
   private:
     std::string target_, name_;

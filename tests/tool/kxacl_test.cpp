@@ -3,7 +3,9 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <atomic>
 #include <random>
+#include <thread>
 
 #include <sys/stat.h>
 
@@ -376,6 +378,92 @@ TEST_F(KxaclTool, DiffShowsEachEntrysChangeAndGatesOnGrantingMore) {
         "mech":null,"id":"staff","perms":"rwx","mask":11},"old":{"perms":"rw","mask":3},
         "new":{"perms":"rwx","mask":11},"grants_more":{"perms":"x","mask":8}})"));
     EXPECT_EQ(j["grants_more"], true);
+}
+
+// What a daemon reads from the ACL file, through its cached file when that
+// is current: the anyother entry's mask tells the versions apart.
+std::int64_t daemon_read(const std::string &file) {
+    kxtest::acl_read r(file, SEC_F_ACL_CACHE | SEC_F_ACL_CONVERT);
+    kx_uint32_t mask = 0;
+    if (r.status != 0 || sec__single_acle_perm(&r.acl, 2, nullptr, nullptr, nullptr, &mask) != 0)
+        return -1;
+    return mask;
+}
+
+TEST_F(KxaclTool, InstallNeverLeavesTheOldVersionTrusted) {
+    const std::string src = dir + "/src.acl", staged = dir + "/staged";
+    // Daemons read and cache the file all along.
+    std::atomic<bool> done{false};
+    std::thread readers([&] {
+        while (!done)
+            daemon_read(acl);
+    });
+    for (int version = 1; version <= 6; ++version) {
+        const std::string text = "o " + std::string("rwcxCq").substr(0, version) + "\n";
+        // The file in place was compiled and cached long after it was written
+        // (forced past a cached file that a replacement left in force).
+        kxtest::shift_mtime(acl, -30);
+        const auto compiled = run_kxacl({"compile", acl, "--cache", "--force"});
+        EXPECT_EQ(compiled.exit_code, 0) << compiled.err;
+        const std::int64_t before = daemon_read(acl);
+        // The new text is older-dated than that cached file, as cp -p, rsync -t
+        // and tar leave it.
+        kxtest::write_file(src, text);
+        kxtest::shift_mtime(src, -20);
+        if (version % 2) { // without install, the old version stays in force
+            kxtest::write_file(staged, text);
+            kxtest::shift_mtime(staged, -20);
+            EXPECT_EQ(::rename(staged.c_str(), acl.c_str()), 0);
+            EXPECT_EQ(daemon_read(acl), before);
+            continue;
+        }
+        const auto r = run_kxacl({"install", src, acl});
+        EXPECT_EQ(r.exit_code, 0) << r.err;
+        EXPECT_EQ(daemon_read(acl), (1 << version) - 1) << version;
+    }
+    done = true;
+    readers.join();
+}
+
+TEST_F(KxaclTool, InstallGivesOwnerAndModeAndRefusesWhatDoesNotCompile) {
+    const std::string src = dir + "/src.acl", dest = dir + "/dest.acl";
+    kxtest::write_file(src, "o rw\n");
+    auto r = run_kxacl({"install", src, dest, "--mode", "0640", "--cache"});
+    ASSERT_EQ(r.exit_code, 0) << r.err;
+    EXPECT_EQ(r.out, "installed " + src + " as " + dest + ": 1 entries, owner 0:0, mode 0640\n" +
+                         "cached in " + dest + ".cacl\n");
+    EXPECT_EQ(kxtest::status_of(dest).st_mode & 07777, 0640u);
+    // The cached file serves readers at once.
+    EXPECT_EQ(run_kxacl({"explain", dest}).out.rfind("answered from " + dest + ".cacl", 0), 0u);
+    // Owner and mode stay DEST's unless given.
+    ASSERT_EQ(::chown(dest.c_str(), 65534, 65534), 0);
+    r = run_kxacl({"install", src, dest, "--json"});
+    ASSERT_EQ(r.exit_code, 0) << r.err;
+    EXPECT_EQ(parsed(r), json::parse("{\"source\":\"" + src + "\",\"file\":\"" + dest +
+                                     "\",\"entries\":1,\"bytes\":5,\"uid\":65534,"
+                                     "\"gid\":65534,\"mode\":\"0640\",\"cached\":false}"));
+
+    const std::vector<std::pair<std::vector<std::string>, std::string>> refused = {
+        {{"install", acl, dest, "--mode", "4755"},
+         "kxacl: --mode takes permission bits up to "
+         "0777, not 4755\n"},
+        {{"install", acl, dir}, "kxacl: " + dir + " is not a regular file\n"},
+        {{"install", acl, dest + ".cacl"},
+         "kxacl: refusing to write " + dest +
+             ".cacl: cached compiled files are written by the library only (use --cache)\n"},
+    };
+    for (const auto &[args, err] : refused) {
+        r = run_kxacl(args);
+        EXPECT_EQ(r.exit_code, 2);
+        EXPECT_EQ(r.err, err);
+    }
+    kxtest::write_file(src, "o rw\ng\n");
+    r = run_kxacl({"install", src, dest});
+    EXPECT_EQ(r.exit_code, 2);
+    EXPECT_EQ(r.err.rfind("2650-172 Failure", 0), 0u) << r.err;
+    EXPECT_EQ(kxtest::read_file(dest), "o rw\n");
+    EXPECT_EQ(kxtest::dir_entries(dir),
+              (std::vector<std::string>{"dest.acl", "dest.acl.cacl", "res.acl", "src.acl"}));
 }
 
 TEST_F(KxaclTool, CheckReadsThroughACurrentCachedFile) {
