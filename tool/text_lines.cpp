@@ -62,13 +62,6 @@ text_entry entry_of(const std::vector<std::string> &tokens, unsigned line) {
     return e;
 }
 
-std::string text_path(const invocation &inv) {
-    if (inv.owner.empty())
-        return inv.input;
-    const passwd *pw = ::getpwnam(inv.owner.c_str());
-    return pw ? std::string(pw->pw_dir) + "/" + inv.input : inv.input;
-}
-
 } // namespace
 
 std::vector<text_entry> text_entries(std::string_view text) {
@@ -85,6 +78,13 @@ std::vector<text_entry> text_entries(std::string_view text) {
         start = end + 1;
     }
     return entries;
+}
+
+std::string text_path(const invocation &inv) {
+    if (inv.owner.empty())
+        return inv.input;
+    const passwd *pw = ::getpwnam(inv.owner.c_str());
+    return pw ? std::string(pw->pw_dir) + "/" + inv.input : inv.input;
 }
 
 std::vector<text_entry> text_entries_of(const invocation &inv) {

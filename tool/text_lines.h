@@ -26,6 +26,10 @@ struct text_entry {
 // the library would refuse, are left out.
 std::vector<text_entry> text_entries(std::string_view text);
 
+// The path of the ACL text file of inv.input: in the home directory of
+// inv.owner when one is given, as the library resolves it.
+std::string text_path(const invocation &inv);
+
 // The entry lines of the ACL text file of inv.input (in the home directory
 // of inv.owner when one is given); none when the file cannot be read.
 std::vector<text_entry> text_entries_of(const invocation &inv);

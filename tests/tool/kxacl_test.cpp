@@ -4,6 +4,7 @@
 #include <nlohmann/json.hpp>
 
 #include <atomic>
+#include <functional>
 #include <random>
 #include <thread>
 
@@ -464,6 +465,129 @@ TEST_F(KxaclTool, InstallGivesOwnerAndModeAndRefusesWhatDoesNotCompile) {
     EXPECT_EQ(kxtest::read_file(dest), "o rw\n");
     EXPECT_EQ(kxtest::dir_entries(dir),
               (std::vector<std::string>{"dest.acl", "dest.acl.cacl", "res.acl", "src.acl"}));
+}
+
+// The codes of lint's warnings, with their lines ("KX101@4"; file states
+// without one), in the order printed.
+std::vector<std::string> lint_codes(const std::string &file) {
+    const auto r = run_kxacl({"lint", file, "--json"});
+    const json warnings = json::parse(r.out)["warnings"];
+    EXPECT_EQ(r.exit_code, warnings.empty() ? 0 : 1) << r.err;
+    std::vector<std::string> codes;
+    for (const json &w : warnings)
+        codes.push_back(w["code"].get<std::string>() +
+                        (w["line"].is_null() ? "" : "@" + std::to_string(w["line"].get<int>())));
+    return codes;
+}
+
+TEST_F(KxaclTool, LintFindsEachPlantedEntryProblem) {
+    kxtest::write_file(acl,
+                       "# planted problems\n"
+                       "n rx\n"
+                       "o rx\n"
+                       "u unix root rwcxCqledvsao\n"
+                       "u unix bob@fe80:0:0:0:0:0:0:1 rx\n"
+                       "u unx ann@h rx\n"
+                       "u unix carl@h r\n"
+                       "g admins rwcxCqledvsao\n"
+                       "e vgn2 svc@ rx\n",
+                       0664);
+    EXPECT_EQ(lint_codes(acl),
+              (std::vector<std::string>{"KX105@2", "KX101@4", "KX102@5", "KX103@6", "KX104@7",
+                                        "KX104@7", "KX106@8", "KX101@9", "KX201"}));
+    auto r = run_kxacl({"lint", acl});
+    EXPECT_NE(r.out.find(acl + ":5: KX102 ipv6-not-canonical: u unix bob@fe80:0:0:0:0:0:0:1: " +
+                         "the IPv6 host part is not in its canonical form, so a requester's " +
+                         "identity (bob@fe80::1) never matches it; write it that way\n"),
+              std::string::npos)
+        << r.out;
+    EXPECT_NE(r.out.find("  fix: chmod go-w " + acl + "\n"), std::string::npos);
+    // --mech knows another mechanism, --read-like widens what n may grant.
+    r = run_kxacl({"lint", acl, "--mech", "UNX", "--read-like", "rx", "--json"});
+    EXPECT_EQ(parsed(r)["warnings"].size(), 7u);
+    // A buffer file gives positions in place of lines, and has no file states.
+    const json b = parsed(run_kxacl({"lint", compiled(), "--json"}));
+    EXPECT_EQ(b["warnings"][4], json::parse(R"({"code":"KX104","name":"fallback-grants-more",
+        "line":null,"position":5,"message":"u unix carl@h lacks x, which the anyother entry (entry 7) grants to every other authenticated requester","fix":null})"))
+        << b;
+}
+
+TEST_F(KxaclTool, LintFindsCacheStatesAndTheirFixes) {
+    kxtest::write_file(acl, "o r\n");
+    const std::string cacl = acl + ".cacl";
+    const auto cache = [&] { ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0); };
+    struct {
+        const char *code;
+        std::function<void()> plant;
+    } cases[] = {
+        {nullptr, cache},
+        {"KX202", [&] { ASSERT_EQ(::mkdir(cacl.c_str(), 0755), 0); }},
+        {"KX203", [&] { kxtest::write_file(cacl, "", 0); }},
+        {"KX204",
+         [&] {
+             cache();
+             ASSERT_EQ(::chmod(cacl.c_str(), 0600), 0);
+         }},
+        {"KX205",
+         [&] {
+             cache();
+             ASSERT_EQ(::link(cacl.c_str(), (dir + "/x").c_str()), 0);
+         }},
+        {"KX206",
+         [&] {
+             kxtest::write_file(cacl, "");
+             kxtest::shift_mtime(cacl, 5);
+         }},
+        {"KX207",
+         [&] {
+             cache();
+             kxtest::shift_mtime(acl, 20);
+         }},
+        {"KX208",
+         [&] {
+             cache();
+             kxtest::set_mtime(acl, kxtest::status_of(cacl).st_mtim.tv_sec);
+         }},
+        {"KX209",
+         [&] {
+             cache();
+             kxtest::write_file(acl, "o rw\n");
+             kxtest::shift_mtime(acl, -20);
+         }},
+        {"KX210", [&] { kxtest::write_file(acl + ".0f3a", ""); }},
+        {"KX210", [&] { kxtest::write_file(acl + ".kxacl-Ab12Cd", ""); }},
+    };
+    for (const auto &c : cases) {
+        ::rmdir(cacl.c_str());
+        for (const auto &name : kxtest::dir_entries(dir))
+            if (name != "res.acl")
+                ::unlink((dir + "/" + name).c_str());
+        kxtest::write_file(acl, "o r\n");
+        kxtest::shift_mtime(acl, -10);
+        c.plant();
+        EXPECT_EQ(lint_codes(acl),
+                  c.code ? std::vector<std::string>{c.code} : std::vector<std::string>{})
+            << (c.code ? c.code : "clean");
+    }
+    // Each state comes with the command that puts it right.
+    const json w = parsed(run_kxacl({"lint", acl, "--json"}))["warnings"][0];
+    EXPECT_EQ(w["fix"], "rm " + acl + ".kxacl-Ab12Cd");
+    kxtest::write_file(acl, "o r\n", 0644);
+    ASSERT_EQ(::unlink((acl + ".kxacl-Ab12Cd").c_str()), 0);
+    kxtest::write_file(cacl, "", 0);
+    EXPECT_EQ(parsed(run_kxacl({"lint", acl, "--json"}))["warnings"][0]["fix"],
+              "rm " + cacl + " && kxacl compile " + acl + " --cache");
+}
+
+TEST_F(KxaclTool, LintIsSilentOnTheExampleFile) {
+    kxtest::write_file(acl, kxtest::read_file(KXACL_EXAMPLE_ACL));
+    kxtest::shift_mtime(acl, -10);
+    for (int round = 0; round < 2; ++round) { // without and with its cached file
+        const auto r = run_kxacl({"lint", acl});
+        EXPECT_EQ(r.exit_code, 0) << r.out << r.err;
+        EXPECT_EQ(r.out + r.err, "");
+        ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
+    }
 }
 
 TEST_F(KxaclTool, CheckReadsThroughACurrentCachedFile) {
