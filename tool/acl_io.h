@@ -89,6 +89,11 @@ std::vector<unsigned char> read_file(const std::string &path);
 // when there is no such file.
 std::optional<struct stat> file_status(const std::string &path, bool follow);
 
+// The mode of a file that replaces path: that of the file it replaces, its
+// set-id and sticky bits only when the running user owns it, else 0644 less
+// the umask. Throws tool_error when path is there but not a regular file.
+mode_t mode_for(const std::string &path);
+
 // A file written beside its target, target + ".kxacl-XXXXXX", and renamed
 // over it; removed again unless commit() renamed it.
 class staged_file {

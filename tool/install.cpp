@@ -38,16 +38,10 @@ mode_t parse_mode(const std::string &text) {
 // DEST's owner, group and mode, changed as the options say. A new DEST
 // belongs to the running user, or to the named owner and that user's group.
 ownership ownership_for(const invocation &inv, const std::optional<struct stat> &dest) {
-    ownership o{::geteuid(), ::getegid(), 0};
+    ownership o{::geteuid(), ::getegid(), mode_for(inv.second)};
     if (dest) {
-        o = {dest->st_uid, dest->st_gid, static_cast<mode_t>(dest->st_mode & 07777)};
-        // Set-id and sticky bits pass on only from a file of the running user.
-        if (dest->st_uid != ::geteuid())
-            o.mode &= 0777;
-    } else {
-        const mode_t mask = ::umask(0);
-        ::umask(mask);
-        o.mode = 0644 & ~mask;
+        o.uid = dest->st_uid;
+        o.gid = dest->st_gid;
     }
     if (!inv.owner.empty()) {
         const passwd *pw = ::getpwnam(inv.owner.c_str());
