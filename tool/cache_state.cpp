@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <ctime>
 #include <vector>
 
 #include <grp.h>
@@ -93,15 +94,15 @@ void remove_judged(const cache_view &view) {
 
 } // namespace
 
-cache_outcome settle_cache(const std::string &text, const char *owner, sec_perm_set_t templates,
-                           unsigned rflags, bool force) {
+cache_outcome settle_cache(const std::string &text, sec_perm_set_t templates, unsigned rflags,
+                           bool force) {
     cache_outcome out;
     cache_view view = judge_cache(text);
     if (force && (rflags & SEC_F_ACL_CACHE) == 0 && removable_by_force(view, templates)) {
         remove_judged(view);
         acl_buffer again;
         kx_uint32_t flags = 0;
-        check_status(sec_read_acl_file(text.c_str(), owner, templates,
+        check_status(sec_read_acl_file(text.c_str(), nullptr, templates,
                                        SEC_F_ACL_TEXT | SEC_F_ACL_CACHE, again.get(), &flags));
         rflags = flags;
         view = judge_cache(text);
@@ -142,9 +143,19 @@ cache_view judge_cache(const std::string &text) {
     if (!text_st)
         throw tool_error(text + " does not exist");
     view.text_st = *text_st;
-    if (const auto cache_st = file_status(view.cache, false)) {
-        view.cache_st = *cache_st;
-        view.state = state_of(view.text_st, view.cache_st);
+    // The library's writer holds an empty cached file of mode 0 while it
+    // writes the new one beside it: only one that stays is a killed
+    // writer's. Writing takes milliseconds; give it two seconds.
+    for (int wait = 0; wait <= 40; ++wait) {
+        view.state = cache_state::absent;
+        if (const auto cache_st = file_status(view.cache, false)) {
+            view.cache_st = *cache_st;
+            view.state = state_of(view.text_st, view.cache_st);
+        }
+        if (view.state != cache_state::killed_writer ||
+            ::time(nullptr) - view.cache_st.st_ctim.tv_sec > 2)
+            break;
+        ::usleep(50'000);
     }
     return view;
 }

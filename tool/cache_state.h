@@ -55,12 +55,12 @@ struct cache_outcome {
     std::string problem;  // why no cached file serves readers, with the fix
 };
 
-// Settles the cached file after text was read with SEC_F_ACL_TEXT and
-// SEC_F_ACL_CACHE, which ended with rflags. With force, a cached file that
-// the library keeps because it is newer than the text (holding another ACL,
-// empty or hard-linked) is removed and written again.
-cache_outcome settle_cache(const std::string &text, const char *owner, sec_perm_set_t templates,
-                           unsigned rflags, bool force);
+// Settles the cached file after the text at path text was read with
+// SEC_F_ACL_TEXT and SEC_F_ACL_CACHE, which ended with rflags. With force, a
+// cached file that the library keeps because it is newer than the text
+// (holding another ACL, empty or hard-linked) is removed and written again.
+cache_outcome settle_cache(const std::string &text, sec_perm_set_t templates, unsigned rflags,
+                           bool force);
 
 // A path or word as one shell word: quoted when it holds anything but
 // letters, digits and /._-+,:=@%.

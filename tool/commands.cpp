@@ -22,6 +22,7 @@
 #include "entries.h"
 #include "json.h"
 #include "templates.h"
+#include "text_lines.h"
 
 namespace kxtool {
 namespace {
@@ -78,10 +79,11 @@ int run_compile(const invocation &inv) {
     if (!inv.output.empty())
         write_buffer_file(inv.output, acl.bytes());
     const auto entries = list_entries(acl, in.templates);
+    // With an owner the text lies in the owner's home directory.
+    const std::string path = text_path(inv);
     cache_outcome cache;
     if (inv.cache)
-        cache = settle_cache(inv.input, inv.owner.empty() ? nullptr : inv.owner.c_str(),
-                             in.templates.get(), rflags, inv.force);
+        cache = settle_cache(path, in.templates.get(), rflags, inv.force);
     if (!cache.problem.empty() && inv.json)
         throw tool_error(cache.problem);
     if (inv.json) {
@@ -101,9 +103,9 @@ int run_compile(const invocation &inv) {
                       std::to_string(count_subacls(entries)) + " sub-ACLs, " +
                       std::to_string(acl.bytes().length) + " bytes\n";
     if (cache.written)
-        out += "cached in " + inv.input + ".cacl\n";
+        out += "cached in " + path + ".cacl\n";
     else if (cache.current)
-        out += inv.input + ".cacl is current already\n";
+        out += path + ".cacl is current already\n";
     if (!cache.note.empty())
         out += "note: " + cache.note + "\n";
     if (!inv.output.empty())

@@ -112,7 +112,7 @@ int run_install(const invocation &inv) {
         kx_uint32_t rflags = 0;
         check_status(sec_read_acl_file(dest.c_str(), nullptr, templates.get(),
                                        SEC_F_ACL_TEXT | SEC_F_ACL_CACHE, cached.get(), &rflags));
-        cache = settle_cache(dest, nullptr, templates.get(), rflags, false);
+        cache = settle_cache(dest, templates.get(), rflags, false);
     }
     const std::size_t entries = list_entries(acl, templates).size();
     if (inv.json && cache.problem.empty()) {
