@@ -208,7 +208,7 @@ int run_explain(const invocation &inv) {
         return exit_ok;
     }
     if (from_cache)
-        print("answered from " + inv.input + ".cacl, the cached file that readers use\n");
+        print("answered from " + text_path(inv) + ".cacl, the cached file that readers use\n");
     print(human(answers, acl, in.templates));
     return exit_ok;
 }
