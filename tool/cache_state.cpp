@@ -191,7 +191,7 @@ std::string cache_trouble(const cache_view &view) {
 }
 
 std::string cache_fix(const cache_view &view) {
-    const std::string compile = "kxacl compile " + shell_word(view.text) + " --cache";
+    std::string compile = "kxacl compile " + shell_word(view.text) + " --cache";
     switch (view.state) {
     case cache_state::absent:
     case cache_state::current:
