@@ -5,6 +5,7 @@
   man_pages.py lint MANDIR MANDOC            mandoc finds nothing to warn about
   man_pages.py extract MANDIR OUTDIR         writes the pages' examples as files
   man_pages.py run PROGRAM ACL EXPECTED      runs an example, compares its output
+  man_pages.py installed MANDIR CMAKE BUILD  installs the pages of BUILD, renders each
 
 Examples are the .EX/.EE blocks of the pages. Each follows a comment line
 '.\\" example: KIND' where KIND is c (a C program, compiled against the
@@ -155,6 +156,39 @@ def run(program, acl, expected):
     print(f'{program}: output as on its page')
 
 
+def installed(mandir, cmake, build):
+    """Installs the pages into a fresh prefix: every page of the tree must be
+    there, and render with man -l (which follows link pages)."""
+    with tempfile.TemporaryDirectory() as prefix:
+        # The install scripts of the two folders that install pages, so that
+        # nothing else of the tree (such as files that installing writes into
+        # the build tree) is touched by a test that runs beside others.
+        for folder in ('man', 'tool'):
+            subprocess.run([cmake, f'-DCMAKE_INSTALL_PREFIX={prefix}', '-P',
+                            str(pathlib.Path(build) / folder / 'cmake_install.cmake')],
+                           check=True, capture_output=True)
+        installed_man = pathlib.Path(prefix) / 'share' / 'man'
+        wanted = [p.relative_to(mandir) for p in pages(mandir)] + [pathlib.Path('man1/kxacl.1')]
+        missing = [str(w) for w in wanted if not (installed_man / w).is_file()]
+        if missing:
+            sys.exit('not installed: ' + ' '.join(missing))
+        man = shutil.which('man')
+        if not man:
+            print(f'{len(wanted)} pages installed; man is not there to render them')
+            return
+        failed = []
+        for page in wanted:
+            result = subprocess.run([man, '-l', str(page)], cwd=installed_man,
+                                    capture_output=True, text=True,
+                                    env=dict(os.environ, MANWIDTH='80', MANPAGER='cat',
+                                             PAGER='cat'))
+            if result.returncode != 0 or result.stderr or 'NAME' not in result.stdout:
+                failed.append(f'{page}: {result.stderr}')
+        if failed:
+            sys.exit('man -l fails:\n' + '\n'.join(failed))
+        print(f'{len(wanted)} pages installed and rendered')
+
+
 def main(argv):
     command, args = argv[1], argv[2:]
     if command == 'symbols':
@@ -172,6 +206,8 @@ def main(argv):
         extract(args[0], args[1])
     elif command == 'run':
         run(*args)
+    elif command == 'installed':
+        installed(*args)
     else:
         sys.exit(f'unknown command {command}')
 
