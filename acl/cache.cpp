@@ -33,10 +33,16 @@ bool same_owner(const struct stat &a, const struct stat &b) {
     return a.st_uid == b.st_uid && a.st_gid == b.st_gid;
 }
 
-// The ACL file is still the file whose status was taken earlier.
-bool same_file_version(const struct stat &a, const struct stat &b) {
-    return a.st_dev == b.st_dev && a.st_ino == b.st_ino && a.st_size == b.st_size &&
-           a.st_mtim.tv_sec == b.st_mtim.tv_sec && a.st_mtim.tv_nsec == b.st_mtim.tv_nsec;
+// Whether the name aclfname still leads to the file, unchanged, whose
+// status acl_st is: the last look before the rename, so that the CACL file
+// of a file that was replaced or rewritten meanwhile does not land beside
+// its successor. A change after this look cannot make the CACL file
+// trusted: its time, that of its write, is earlier than the change's.
+bool still_named(const char *aclfname, const struct stat &acl_st) {
+    struct stat now;
+    return sys_stat(aclfname, &now) == 0 && same_inode(acl_st, now) &&
+           acl_st.st_size == now.st_size && acl_st.st_mtim.tv_sec == now.st_mtim.tv_sec &&
+           acl_st.st_mtim.tv_nsec == now.st_mtim.tv_nsec;
 }
 
 // 2650-135 when a status cannot be taken; the report names the ACL file
@@ -92,8 +98,7 @@ class open_cacl {
   private:
     void remove_if_still_ours() {
         struct stat ours, named;
-        if (sys_fstat(fd_, &ours) == 0 && sys_lstat(name_, &named) == 0 &&
-            ours.st_dev == named.st_dev && ours.st_ino == named.st_ino)
+        if (sys_fstat(fd_, &ours) == 0 && sys_lstat(name_, &named) == 0 && same_inode(ours, named))
             sys_unlink(name_);
     }
     const char *name_;
@@ -107,7 +112,7 @@ class open_cacl {
 // followed; O_NONBLOCK: a FIFO planted there cannot hang the writer.
 // Nothing is written through this descriptor.
 int open_cacl_file(const char *cacl, bool existed, bool *created) {
-    int flags = O_WRONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+    int flags = O_WRONLY | O_NOFOLLOW | O_NOCTTY | O_NONBLOCK | O_CLOEXEC;
     // A CACL file that was absent is created exclusively, so that "created"
     // is certain; when it appeared meanwhile, another writer is at work and
     // this one gives way (2650-151) rather than racing it.
@@ -162,7 +167,8 @@ kx_int32_t create_temp_file(const char *aclfname, std::size_t path_length, temp_
         struct stat st;
         if (sys_lstat(temp->name, &st) == 0 || errno != ENOENT)
             continue;
-        int fd = sys_open(temp->name, O_CREAT | O_EXCL | O_NOFOLLOW | O_WRONLY | O_CLOEXEC, 0);
+        int fd = sys_open(temp->name,
+                          O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_WRONLY | O_CLOEXEC, 0);
         if (fd >= 0) {
             temp->fd = fd;
             temp->created = true;
@@ -222,11 +228,14 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
     path_buffer cacl;
     cacl_name_of(aclfname, cacl);
 
+    // The owner, group, mode and time that the CACL file is judged by and
+    // given are those of the file whose bytes were compiled, never those of
+    // whatever the name leads to by now.
     struct stat acl_st, cacl_st;
-    if (sys_stat(aclfname, &acl_st) != 0)
+    if (compiled_from)
+        acl_st = *compiled_from;
+    else if (sys_stat(aclfname, &acl_st) != 0)
         return status_failed(aclfname, aclfname, errno);
-    if (compiled_from && !same_file_version(*compiled_from, acl_st))
-        return nothing_written;
     bool existed = sys_lstat(cacl, &cacl_st) == 0;
     if (!existed) {
         if (errno != ENOENT)
@@ -256,6 +265,8 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
         rc = fill_temp_file(&temp, cacl, *acl, acl_st);
     if (rc != SEC_S_OK)
         return rc;
+    if (!still_named(aclfname, acl_st))
+        return nothing_written;
     if (sys_rename(temp.name, cacl) != 0)
         return report<MSG_2650_177>(SEC_S_FILE_ERROR, temp.name, cacl);
     temp.renamed = true;
@@ -309,8 +320,10 @@ cacl_verdict judge_cacl_status(const struct stat &acl_st, const struct stat &cac
          static_cast<std::uint64_t>(v.cacl_st.st_size) > layout::max_buffer_length ||
          v.cacl_st.st_mtim.tv_sec <= acl_st.st_mtim.tv_sec)) {
         v.state = cacl_state::stale;
-    } else if (!cacl_matches_acl(acl_st, v.cacl_st)) {
-        // Not a regular file, or another owner, group or permission bits.
+    } else if (!cacl_matches_acl(acl_st, v.cacl_st) || v.cacl_st.st_nlink != 1) {
+        // Not a regular file, another owner, group or permission bits, or
+        // another name for the same bytes: a hard link from elsewhere, such
+        // as another ACL file's CACL file.
         v.state = cacl_state::foreign;
     }
     return v;

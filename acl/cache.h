@@ -29,10 +29,12 @@ bool cacl_name_of(const char *aclfname, char *cacl);
 // The old CACL file is never changed on failure.
 kx_int32_t sec__cache_aclbuffer(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t force);
 
-// sec__cache_aclbuffer for a buffer compiled from the ACL file whose status
-// was compiled_from: when the ACL file is no longer that file (another
-// inode, size or modification time), nothing is written and the result is
-// 1, so that a buffer of an older text never lands beside a newer one.
+// sec__cache_aclbuffer for a buffer compiled from the ACL file whose
+// status, taken from the descriptor that its bytes were read through, is
+// compiled_from: the CACL file is judged by and given that status alone.
+// When the name no longer leads to that file unchanged (another inode, size
+// or modification time) just before the rename, nothing is written and the
+// result is 1, so that a buffer of an older text never lands beside a newer one.
 kx_int32_t cache_aclbuffer(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t force,
                            const struct stat *compiled_from);
 
@@ -41,7 +43,7 @@ enum class cacl_state {
     trusted,      // its bytes may be returned
     unexaminable, // its status cannot be taken (err says why); absent included
     stale,        // empty, too large for a buffer, or not strictly newer
-    foreign,      // not a regular file, or owner, group or permission bits differ
+    foreign,      // not a regular file, hard-linked, or owner, group or permission bits differ
 };
 struct cacl_verdict {
     cacl_state state;

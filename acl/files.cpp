@@ -2,9 +2,11 @@
 // whole open file into memory.
 #include "files.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <pwd.h>
 #include <sys/stat.h>
@@ -12,6 +14,7 @@
 
 #include "alloc.h"
 #include "frame.h"
+#include "parse.h"
 #include "report.h"
 #include "syscalls.h"
 
@@ -84,21 +87,6 @@ kx_int32_t path_from_working_dir(const char *filename, char *aclfname) {
     return SEC_S_OK;
 }
 
-// 2650-135 for a file whose status cannot be taken, with its Info point.
-kx_int32_t examine_failed(const char *aclfname, int err) {
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(123, text(aclfname), num(err));
-    return report<MSG_2650_135>(SEC_S_FILE_ERROR, aclfname, err);
-}
-
-// 2650-139: got bytes (-1 for a read error) of a file of size bytes.
-kx_int32_t short_read(const char *aclfname, std::uint64_t size, std::int64_t got, int err) {
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(127, text(aclfname), num(size), num(got));
-    int shown = got < 0 ? -1 : byte_count(static_cast<std::size_t>(got));
-    return report<MSG_2650_139>(SEC_S_FILE_ERROR, shown, byte_count(size), err);
-}
-
 // Runs read() and records its time at Perf level 2 (point 6).
 template <typename Read> kx_int32_t timed_read(Read read) {
     perf_timer timer(perf_at(2));
@@ -110,6 +98,13 @@ template <typename Read> kx_int32_t timed_read(Read read) {
     return rc;
 }
 
+// 2650-102 for the bytes asked for to read a file of size bytes.
+kx_int32_t no_memory_for(const char *aclfname, std::uint64_t size, std::size_t asked) {
+    if (trace_level(TRC_INFO) != 0)
+        trace_data(125, text(aclfname), num(size));
+    return no_memory("sec_read_acl_file", asked);
+}
+
 kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, char **aclfbuf,
                       std::size_t *aclfsize) {
     if (size == 0)
@@ -117,16 +112,13 @@ kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, cha
     // The read fills every byte before the NUL, or the buffer goes: only
     // the NUL needs writing, not the whole buffer zeroing first.
     unique_mem<char> buffer(static_cast<char *>(mem_alloc(size + 1)));
-    if (!buffer) {
-        if (trace_level(TRC_INFO) != 0)
-            trace_data(125, text(aclfname), num(size));
-        return no_memory("sec_read_acl_file", size + 1);
-    }
+    if (!buffer)
+        return no_memory_for(aclfname, size, size + 1);
     // One read of the whole size; a short count is not retried.
     errno = 0;
     ssize_t got = sys_read(aclfdes, buffer.get(), size);
     if (got < 0 || static_cast<std::uint64_t>(got) != size)
-        return short_read(aclfname, size, got, got < 0 ? errno : 0);
+        return report_short_read(aclfname, size, got, got < 0 ? errno : 0);
     buffer.get()[size] = '\0';
     *aclfbuf = buffer.release();
     *aclfsize = size;
@@ -134,25 +126,44 @@ kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, cha
 }
 
 kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
-                            std::size_t *aclfsize, bool *replaced) {
+                            std::size_t *aclfsize) {
     struct stat by_name, opened;
     if (sys_stat(aclfname, &by_name) != 0)
-        return examine_failed(aclfname, errno);
+        return report_unexaminable(aclfname, errno);
     if (sys_fstat(aclfdes, &opened) != 0)
-        return examine_failed(aclfname, errno);
+        return report_unexaminable(aclfname, errno);
     auto size = static_cast<std::uint64_t>(by_name.st_size);
     // The size comes from the name, the bytes from the descriptor: when the
     // name has meanwhile been given to another file (a replacing rename),
     // the two belong to different files, and the read counts as short
     // rather than mixing an old file with a new size.
-    if (by_name.st_dev != opened.st_dev || by_name.st_ino != opened.st_ino) {
-        *replaced = true;
-        return short_read(aclfname, size, 0, 0);
-    }
+    if (!same_inode(by_name, opened))
+        return report_short_read(aclfname, size, 0, 0);
     return read_sized(aclfname, aclfdes, size, aclfbuf, aclfsize);
 }
 
+// The window of a text_reader: large enough for many lines per read, and
+// always for more than the longest line, so that a window full of one
+// line proves that line too long.
+constexpr std::size_t text_window_size = 64 * 1024;
+static_assert(text_window_size > max_line_length);
+
 } // namespace
+
+// 2650-135 for a file whose status cannot be taken, with its Info point.
+kx_int32_t report_unexaminable(const char *aclfname, int err) {
+    if (trace_level(TRC_INFO) != 0)
+        trace_data(123, text(aclfname), num(err));
+    return report<MSG_2650_135>(SEC_S_FILE_ERROR, aclfname, err);
+}
+
+// 2650-139: got bytes (-1 for a read error) of a file of size bytes.
+kx_int32_t report_short_read(const char *aclfname, std::uint64_t size, std::int64_t got, int err) {
+    if (trace_level(TRC_INFO) != 0)
+        trace_data(127, text(aclfname), num(size), num(got));
+    int shown = got < 0 ? -1 : byte_count(static_cast<std::size_t>(got));
+    return report<MSG_2650_139>(SEC_S_FILE_ERROR, shown, byte_count(size), err);
+}
 
 kx_int32_t sec__get_aclfname(const char *filename, const char *username, char *aclfname,
                              uid_t *uid) {
@@ -193,15 +204,6 @@ kx_int32_t acl__lock_acl_file(const char *, int, kx_uint32_t) {
     return SEC_S_OK;
 }
 
-kx_int32_t read_whole_file(const char *aclfname, int aclfdes, char **aclfbuf, std::size_t *aclfsize,
-                           bool *replaced) {
-    *aclfbuf = nullptr;
-    *aclfsize = 0;
-    *replaced = false;
-    return timed_read(
-        [&] { return read_into_buffer(aclfname, aclfdes, aclfbuf, aclfsize, replaced); });
-}
-
 kx_int32_t read_known_size(const char *aclfname, int aclfdes, std::uint64_t size, char **aclfbuf,
                            std::size_t *aclfsize) {
     *aclfbuf = nullptr;
@@ -211,8 +213,79 @@ kx_int32_t read_known_size(const char *aclfname, int aclfdes, std::uint64_t size
 
 kx_int32_t acl__read_acl_file(const char *aclfname, int aclfdes, char **aclfbuf,
                               std::size_t *aclfsize) {
-    bool replaced = false;
-    return read_whole_file(aclfname, aclfdes, aclfbuf, aclfsize, &replaced);
+    *aclfbuf = nullptr;
+    *aclfsize = 0;
+    return timed_read([&] { return read_into_buffer(aclfname, aclfdes, aclfbuf, aclfsize); });
+}
+
+text_reader::text_reader(const char *aclfname, int aclfdes, std::uint64_t size)
+    : name_(aclfname), fd_(aclfdes), size_(size),
+      capacity_(static_cast<std::size_t>(std::min<std::uint64_t>(size, text_window_size))) {}
+
+text_reader::~text_reader() {
+    std::free(window_);
+}
+
+// Reads what the window can take into it.
+kx_int32_t text_reader::fill() {
+    std::size_t want =
+        static_cast<std::size_t>(std::min<std::uint64_t>(capacity_ - held_, size_ - read_));
+    errno = 0;
+    ssize_t got = 0;
+    timed_read([&] {
+        got = sys_read(fd_, window_ + held_, want);
+        return SEC_S_OK;
+    });
+    if (got < 0 || static_cast<std::size_t>(got) != want) {
+        std::int64_t total = got < 0 ? -1 : static_cast<std::int64_t>(read_) + got;
+        return report_short_read(name_, size_, total, got < 0 ? errno : 0);
+    }
+    held_ += want;
+    read_ += want;
+    window_[held_] = '\0'; // nothing past the bytes read is ever left unwritten
+    return SEC_S_OK;
+}
+
+kx_int32_t text_reader::next(text_run *run) {
+    if (!window_) {
+        window_ = static_cast<char *>(mem_alloc(capacity_ + 1));
+        if (!window_)
+            return no_memory_for(name_, size_, capacity_ + 1);
+    }
+    // The line that the last run left unfinished moves to the front.
+    std::memmove(window_, window_ + consumed_, held_ - consumed_);
+    held_ -= consumed_;
+    consumed_ = 0;
+    for (;;) {
+        if (read_ == size_) {
+            window_[held_] = '\0';
+            *run = {window_, held_ + 1, true};
+            return SEC_S_OK;
+        }
+        std::size_t scanned = held_;
+        if (scanned == capacity_) {
+            *run = {window_, held_, false};
+            return SEC_S_OK;
+        }
+        kx_int32_t rc = fill();
+        if (rc != SEC_S_OK)
+            return rc;
+        // The window never holds a NUL before this read: one among the new
+        // bytes ends the text, and one more byte than the NUL's own is
+        // counted so that the parser sees it inside the file.
+        if (auto *nul =
+                static_cast<char *>(std::memchr(window_ + scanned, '\0', held_ - scanned))) {
+            *run = {window_, static_cast<std::size_t>(nul - window_) + 2, true};
+            return SEC_S_OK;
+        }
+        for (std::size_t end = held_; end > scanned; --end) {
+            if (ends_line(window_[end - 1])) {
+                consumed_ = end;
+                *run = {window_, end, false};
+                return SEC_S_OK;
+            }
+        }
+    }
 }
 
 } // namespace kxacl

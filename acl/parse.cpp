@@ -20,11 +20,6 @@ namespace {
 
 inline constexpr kx_uint32_t trace_line_too_long = 115;
 
-// LF, FF and CR each end one line; NUL ends the text.
-bool ends_line(char c) {
-    return c == '\n' || c == '\f' || c == '\r' || c == '\0';
-}
-
 // Skipped before a token. FF and CR are not: they end the line.
 bool is_blank(char c) {
     return c == ' ' || c == '\t' || c == '\v';

@@ -11,6 +11,11 @@ namespace kxacl {
 // Longest line of an ACL file, counted with the character that ends it.
 inline constexpr std::size_t max_line_length = 1096;
 
+// LF, FF and CR each end one line; NUL ends the text.
+inline bool ends_line(char c) {
+    return c == '\n' || c == '\f' || c == '\r' || c == '\0';
+}
+
 // Consumes one line of the text at *tacl (a modifiable text followed by a
 // NUL; *length counts the bytes from the cursor to that NUL, the NUL
 // included; *lineno is the 1-based number of the line at the cursor) and

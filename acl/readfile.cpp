@@ -26,9 +26,9 @@ namespace {
 
 constexpr const char routine[] = "sec_read_acl_file";
 
-// Times a text ACL file is opened again when it was replaced by a rename
-// while being read. Editors and deployment tools replace files that way,
-// and the next open then finds the complete new file.
+// Times a text ACL file is opened when its name was given to another file
+// between its status and its opening. Editors and deployment tools replace
+// files by a rename, and the next open then finds the complete new file.
 constexpr int max_replaced_reads = 3;
 
 // Everything one call works with.
@@ -43,7 +43,7 @@ struct read_call {
     // clear 8 KiB of them first.
     path_buffer aclpath;
     path_buffer caclpath;
-    struct stat acl_st {};
+    struct stat acl_st {}; // by name; once the text is opened, its descriptor's
     uid_t uid = 0;
 
     read_call(const char *filename_, const char *username_, sec_perm_set_t permtmpl_,
@@ -87,22 +87,35 @@ kx_int32_t wrong_owner(const read_call &c) {
     return report<MSG_2650_141>(SEC_S_BAD_PERMISSION, c.aclpath, c.username);
 }
 
-// Resolves and examines the ACL file. A missing or non-regular ACL file is
-// reported with SEC_S_NO_ACL_FILE, the status of a name that leads to no
-// usable file, in the record and as the result alike (2650-135 otherwise
-// comes with SEC_S_FILE_ERROR, for files that exist but fail later). A file
-// that exists but is not regular has no system error number: 0 is shown.
+// The report of a name that leads to no usable file: missing, or not a
+// regular file. SEC_S_NO_ACL_FILE, in the record and as the result alike
+// (2650-135 otherwise comes with SEC_S_FILE_ERROR, for files that exist but
+// fail later). A file that exists but is not regular has no system error
+// number: 0 is shown.
+kx_int32_t not_found(const read_call &c, int err) {
+    return report<MSG_2650_135>(SEC_S_NO_ACL_FILE, c.aclpath, err);
+}
+kx_int32_t not_a_regular_file(const read_call &c) {
+    return not_found(c, 0);
+}
+
+// Takes the status of the ACL file by its name.
+kx_int32_t examine_acl_name(read_call &c) {
+    if (sys_stat(c.aclpath, &c.acl_st) != 0)
+        return not_found(c, errno);
+    return S_ISREG(c.acl_st.st_mode) ? SEC_S_OK : not_a_regular_file(c);
+}
+
+// Resolves and examines the ACL file.
 kx_int32_t examine_acl_file(read_call &c) {
     perf_timer timer(perf_at(1));
     kx_int32_t rc = sec__get_aclfname(c.filename, c.username, c.aclpath, &c.uid);
     if (rc != SEC_S_OK)
         return rc;
-    int err = sys_stat(c.aclpath, &c.acl_st) != 0 ? errno : 0;
+    rc = examine_acl_name(c);
     if (timer.wanted())
         trace_perf(1, c.aclpath, timer);
-    if (err != 0 || !S_ISREG(c.acl_st.st_mode))
-        return report<MSG_2650_135>(SEC_S_NO_ACL_FILE, c.aclpath, err);
-    return SEC_S_OK;
+    return rc;
 }
 
 void trace_verdict(const read_call &c, const cacl_verdict &v) {
@@ -126,10 +139,12 @@ void trace_verdict(const read_call &c, const cacl_verdict &v) {
 }
 
 // Opens a file for reading, with the Perf point of opening. Neither file
-// can hang the call if a FIFO replaced it.
+// can hang the call if a FIFO replaced it, nor become the controlling
+// terminal of a daemon if a terminal did; whatever is not a regular file is
+// refused on the descriptor's status before a byte is read.
 int open_timed(const char *source, int flags) {
     perf_timer timer(perf_at(2));
-    int fd = sys_open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC | flags);
+    int fd = sys_open(source, O_RDONLY | O_NOCTTY | O_NONBLOCK | O_CLOEXEC | flags);
     int err = errno;
     if (timer.wanted())
         trace_perf(4, source, timer);
@@ -139,9 +154,14 @@ int open_timed(const char *source, int flags) {
 
 struct descriptor {
     int fd;
-    ~descriptor() {
+    explicit descriptor(int fd_) : fd(fd_) {}
+    descriptor(const descriptor &) = delete;
+    descriptor &operator=(const descriptor &) = delete;
+    ~descriptor() { reset(-1); }
+    void reset(int other) {
         if (fd >= 0)
             sys_close(fd);
+        fd = other;
     }
 };
 
@@ -175,53 +195,6 @@ int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
     return std::exchange(file.fd, -1);
 }
 
-// Opens the text ACL file for reading.
-int open_text(const read_call &c) {
-    int fd = open_timed(c.aclpath, 0);
-    if (fd < 0) {
-        int err = errno;
-        if (info_traced())
-            trace_data(122, text(c.aclpath), num(err));
-        errno = err;
-    }
-    return fd;
-}
-
-// With a user name, the text ACL file that was opened must again be that
-// user's: it may have been replaced since its name was examined.
-bool opened_text_acceptable(const read_call &c, int fd) {
-    if (!c.username)
-        return true;
-    struct stat st;
-    if (sys_fstat(fd, &st) != 0)
-        return false;
-    return st.st_size == 0 || owner_rule_holds(c, st);
-}
-
-// Opens, locks and reads the text ACL file whole. *replaced tells a read
-// that failed because the name was given to another file meanwhile.
-kx_int32_t read_source(read_call &c, unique_mem<char> *contents, std::size_t *size,
-                       bool *replaced) {
-    *replaced = false;
-    if (info_traced())
-        trace_data(121, text(c.aclpath));
-    descriptor file{open_text(c)};
-    if (file.fd < 0) {
-        int err = errno;
-        return report<MSG_2650_137>(SEC_S_FILE_ERROR, c.aclpath, err);
-    }
-    if (!opened_text_acceptable(c, file.fd))
-        return wrong_owner(c);
-    perf_timer timer(perf_at(1));
-    acl__lock_acl_file(c.aclpath, file.fd, 1);
-    char *bytes = nullptr;
-    kx_int32_t rc = read_whole_file(c.aclpath, file.fd, &bytes, size, replaced);
-    contents->reset(bytes);
-    if (timer.wanted())
-        trace_perf(2, c.aclpath, timer);
-    return rc;
-}
-
 // Reads the trusted CACL file open as fd, whose status is cacl_st: its
 // bytes become the ACL buffer, passed through sec_convert_acl_to_host when
 // the caller asks. False, with the error record cleared and acl empty,
@@ -231,6 +204,10 @@ bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
     descriptor file{fd};
     if (info_traced())
         trace_data(121, text(c.caclpath));
+    if (sys_clear_nonblock(fd) != 0) {
+        cu_set_no_error_1();
+        return false;
+    }
     perf_timer timer(perf_at(1));
     acl__lock_acl_file(c.caclpath, fd, 1);
     char *bytes = nullptr;
@@ -255,18 +232,6 @@ bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
     return true;
 }
 
-// Reads the text ACL file whole, opening it again if it was replaced while
-// being read.
-kx_int32_t read_text(read_call &c, unique_mem<char> *contents, std::size_t *size) {
-    for (int attempt = 1;; ++attempt) {
-        bool replaced = false;
-        kx_int32_t rc = read_source(c, contents, size, &replaced);
-        if (rc == SEC_S_OK || !replaced || attempt == max_replaced_reads)
-            return rc;
-        cu_set_no_error_1();
-    }
-}
-
 // The array of entry trees of one compile, freed from the last to the first.
 struct tree_array {
     sec_acltree_t *trees = nullptr;
@@ -282,20 +247,65 @@ void trace_line(int lineno, const sec_acle_desc &entry) {
     trace_data(114, num(lineno), num(type), text(entry.mech), text(entry.id), num(entry.perm));
 }
 
-// Parses the text line by line into trees, and writes them as one buffer.
-kx_int32_t compile_text(read_call &c, char *contents, std::size_t size) {
-    tree_array trees;
-    char *cursor = contents;
-    std::size_t remaining = size + 1; // the NUL that follows the file's bytes
-    c.lineno = 1;
+// Opens the text ACL file, once: every decision about the text comes from
+// the status of this descriptor, which must be of the file whose status was
+// taken by name. A name given to another file between the two (a rename,
+// a symbolic link flipped) is examined again, up to max_replaced_reads times.
+kx_int32_t open_text(read_call &c, descriptor *file, struct stat *st) {
+    for (int attempt = 1;; ++attempt) {
+        if (attempt > 1) {
+            kx_int32_t rc = examine_acl_name(c);
+            if (rc != SEC_S_OK)
+                return rc;
+        }
+        if (info_traced())
+            trace_data(121, text(c.aclpath));
+        file->reset(open_timed(c.aclpath, 0));
+        if (file->fd < 0) {
+            int err = errno;
+            if (info_traced())
+                trace_data(122, text(c.aclpath), num(err));
+            return report<MSG_2650_137>(SEC_S_FILE_ERROR, c.aclpath, err);
+        }
+        if (sys_fstat(file->fd, st) != 0)
+            return report_unexaminable(c.aclpath, errno);
+        if (same_inode(c.acl_st, *st))
+            return SEC_S_OK;
+        if (attempt == max_replaced_reads)
+            return report_short_read(c.aclpath, static_cast<std::uint64_t>(c.acl_st.st_size), 0, 0);
+    }
+}
+
+// The rules of the text, applied to the file that was opened: a regular
+// file, the user's own when a user name is given (empty or not), within
+// the size limit; then the descriptor reads blocking again.
+kx_int32_t check_opened_text(const read_call &c, int fd, const struct stat &st) {
+    if (!S_ISREG(st.st_mode))
+        return not_a_regular_file(c);
+    if (c.username && !owner_rule_holds(c, st))
+        return wrong_owner(c);
+    auto size = static_cast<std::uint64_t>(st.st_size);
+    if (size > SEC_ACL_TEXT_MAX_SIZE)
+        return report_short_read(c.aclpath, size, 0, EFBIG);
+    if (sys_clear_nonblock(fd) != 0)
+        return report_short_read(c.aclpath, size, -1, errno);
+    return SEC_S_OK;
+}
+
+// Parses one run of lines into the trees. The parser stops at the end of a
+// run that is not final (its lines all end within it), and where the text
+// ends in a final one.
+kx_int32_t compile_run(read_call &c, const text_run &run, const space_bytes &spaces,
+                       tree_array &trees) {
     bool lines_traced = trace_level(TRC_INFO) > 7;
-    const space_bytes spaces;
+    char *cursor = run.start;
+    std::size_t remaining = run.length;
     for (;;) {
         sec_acle_desc entry{};
         kx_int32_t rc =
             read_acle_from_text(spaces, c.permtmpl, &cursor, &remaining, &c.lineno, &entry);
         if (rc == 0)
-            break;
+            return SEC_S_OK;
         if (rc != 1)
             return rc;
         if (lines_traced)
@@ -306,16 +316,45 @@ kx_int32_t compile_text(read_call &c, char *contents, std::size_t size) {
         if (rc != SEC_S_OK)
             return rc;
     }
+}
+
+// Reads the text from fd run by run, parses it line by line into trees, and
+// writes them as one buffer.
+kx_int32_t compile_text(read_call &c, int fd, std::uint64_t size, const perf_timer &timer) {
+    tree_array trees;
+    text_reader reader(c.aclpath, fd, size);
+    const space_bytes spaces;
+    c.lineno = 1;
+    for (text_run run{nullptr, 0, false}; !run.final;) {
+        kx_int32_t rc = reader.next(&run);
+        if (rc != SEC_S_OK)
+            return rc;
+        if (run.final && timer.wanted())
+            trace_perf(2, c.aclpath, timer);
+        rc = compile_run(c, run, spaces, trees);
+        if (rc != SEC_S_OK)
+            return rc;
+    }
     return trees.count > 0 ? sec__acltrees_to_acl(trees.trees, trees.count, c.acl) : SEC_S_OK;
 }
 
-// Compiles the text, then caches the buffer when asked. Caching is
-// optional work: whatever it finds, the read succeeds, and only the missing
-// 0x2 in rflags tells that nothing was cached.
-kx_int32_t compile_and_cache(read_call &c, char *contents, std::size_t size) {
+// Opens, checks and compiles the text, then caches the buffer when asked.
+// Caching is optional work: whatever it finds, the read succeeds, and only
+// the missing 0x2 in rflags tells that nothing was cached. The cache is
+// given the status of the file whose bytes were compiled.
+kx_int32_t compile_and_cache(read_call &c) {
+    descriptor file{-1};
+    struct stat st;
+    kx_int32_t rc = open_text(c, &file, &st);
+    if (rc == SEC_S_OK)
+        rc = check_opened_text(c, file.fd, st);
+    if (rc != SEC_S_OK)
+        return rc;
+    c.acl_st = st;
     c.flags &= ~kx_uint32_t{SEC_F_ACL_CONVERT};
     perf_timer timer(perf_at(1));
-    kx_int32_t rc = compile_text(c, contents, size);
+    acl__lock_acl_file(c.aclpath, file.fd, 1);
+    rc = compile_text(c, file.fd, static_cast<std::uint64_t>(st.st_size), timer);
     if (timer.wanted()) {
         perf_elapsed e = timer.elapsed();
         trace_data(3, text(c.aclpath), num(c.lineno), num(e.ticks), num(e.seconds),
@@ -356,12 +395,7 @@ kx_int32_t read_acl_file(read_call &c) {
             return SEC_S_OK;
         c.flags |= SEC_F_ACL_TEXT;
     }
-    unique_mem<char> contents;
-    std::size_t size = 0;
-    rc = read_text(c, &contents, &size);
-    if (rc != SEC_S_OK)
-        return rc;
-    return compile_and_cache(c, contents.get(), size);
+    return compile_and_cache(c);
 }
 
 } // namespace

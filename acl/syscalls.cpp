@@ -14,6 +14,8 @@ std::atomic<bool> fired{false};
 std::atomic<sys_call> armed_call{sys_call::open};
 std::atomic<long> calls_to_pass{0};
 std::atomic<int> injected_errno{0};
+std::atomic<void (*)(void *)> before_hook{nullptr};
+std::atomic<void *> before_arg{nullptr};
 
 // The slow path of injected(): only while a test has armed the hook.
 bool fault_due(sys_call which) {
@@ -22,6 +24,10 @@ bool fault_due(sys_call which) {
         return false;
     armed.store(false, std::memory_order_relaxed);
     fired.store(true, std::memory_order_relaxed);
+    if (auto hook = before_hook.load(std::memory_order_relaxed)) {
+        hook(before_arg.load(std::memory_order_relaxed));
+        return false;
+    }
     return true;
 }
 
@@ -102,7 +108,16 @@ char *sys_getcwd(char *buf, std::size_t size) {
     return getcwd(buf, size);
 }
 
-void sys_fail_nth(sys_call which, long nth, int err) {
+int sys_clear_nonblock(int fd) {
+    if (injected(sys_call::fcntl))
+        return fail();
+    int flags = fcntl(fd, F_GETFL);
+    return flags < 0 ? -1 : fcntl(fd, F_SETFL, flags & ~O_NONBLOCK);
+}
+
+namespace {
+
+void arm(sys_call which, long nth, int err, void (*hook)(void *), void *arg) {
     armed.store(false, std::memory_order_relaxed);
     fired.store(false, std::memory_order_relaxed);
     if (nth < 0)
@@ -110,7 +125,19 @@ void sys_fail_nth(sys_call which, long nth, int err) {
     armed_call.store(which, std::memory_order_relaxed);
     calls_to_pass.store(nth, std::memory_order_relaxed);
     injected_errno.store(err, std::memory_order_relaxed);
+    before_hook.store(hook, std::memory_order_relaxed);
+    before_arg.store(arg, std::memory_order_relaxed);
     armed.store(true, std::memory_order_relaxed);
+}
+
+} // namespace
+
+void sys_fail_nth(sys_call which, long nth, int err) {
+    arm(which, nth, err, nullptr, nullptr);
+}
+
+void sys_before_nth(sys_call which, long nth, void (*hook)(void *), void *arg) {
+    arm(which, nth, 0, hook, arg);
 }
 
 bool sys_fault_fired() {

@@ -26,6 +26,9 @@ int sys_fchmod(int fd, mode_t mode);
 int sys_rename(const char *from, const char *to);
 int sys_unlink(const char *path);
 char *sys_getcwd(char *buf, std::size_t size);
+// Clears O_NONBLOCK on a descriptor that was opened with it so that the
+// open could not hang on a FIFO, once it is known to be a regular file.
+int sys_clear_nonblock(int fd);
 
 enum class sys_call {
     open,
@@ -39,7 +42,8 @@ enum class sys_call {
     fchmod,
     rename,
     unlink,
-    getcwd
+    getcwd,
+    fcntl
 };
 
 // Fault injection for tests: the call of kind `which` numbered nth (0 is the
@@ -47,7 +51,12 @@ enum class sys_call {
 // err 0 a read or write is made short instead: it moves half the bytes asked
 // for. A negative nth disarms the hook.
 void sys_fail_nth(sys_call which, long nth, int err);
-// True when the fault armed last has happened.
+// Race injection for tests: just before the call of kind `which` numbered
+// nth, hook(arg) runs (and may rename, replace or remove files), then the
+// call goes on as usual; the hook disarms itself. Shares the one slot of
+// sys_fail_nth: arming either disarms the other.
+void sys_before_nth(sys_call which, long nth, void (*hook)(void *), void *arg);
+// True when the fault or hook armed last has happened.
 bool sys_fault_fired();
 
 } // namespace kxacl

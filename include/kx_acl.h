@@ -92,6 +92,15 @@ typedef kx_int32_t (*sec_acl_id_handler)(char *id, char *acle_id);
 #define SEC_F_ACL_CACHE 0x2   /**< write the compiled buffer to the cached file */
 #define SEC_F_ACL_CONVERT 0x4 /**< validate or convert a buffer from the cached file */
 
+/**
+ * Largest ACL text file that sec_read_acl_file compiles, in bytes (64 MiB).
+ * A larger one is refused with 2650-139 (SEC_S_FILE_ERROR), whose
+ * arguments are 0 bytes read, the file's size and EFBIG. The text is read
+ * through a small window, so compiling costs memory in proportion to the
+ * entries, not to the file's size.
+ */
+#define SEC_ACL_TEXT_MAX_SIZE 0x4000000
+
 /* ------------------------------------------------------------------------ */
 /* Message catalogue                                                        */
 /* ------------------------------------------------------------------------ */

@@ -25,6 +25,7 @@ std::string system_error(const std::string &what, const std::string &path) {
 class unique_fd {
   public:
     explicit unique_fd(int fd) : fd_(fd) {}
+    unique_fd(unique_fd &&other) noexcept : fd_(std::exchange(other.fd_, -1)) {}
     unique_fd(const unique_fd &) = delete;
     unique_fd &operator=(const unique_fd &) = delete;
     ~unique_fd() {
@@ -58,15 +59,26 @@ bool write_all(int fd, const void *data, std::size_t size) {
     return transfer_all(fd, static_cast<const unsigned char *>(data), size, ::write);
 }
 
-std::vector<unsigned char> read_file(const std::string &path) {
-    unique_fd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY));
+// Opens a file to read without letting it hang the open (a FIFO) or become
+// the controlling terminal (a terminal device): anything but a regular file
+// is refused before a byte is read.
+unique_fd open_regular_file(const std::string &path, struct stat &st) {
+    unique_fd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK));
     if (fd.get() < 0)
         throw tool_error(system_error("cannot open", path));
-    struct stat st {};
     if (::fstat(fd.get(), &st) != 0)
         throw tool_error(system_error("cannot read", path));
     if (!S_ISREG(st.st_mode))
         throw tool_error(path + " is not a regular file");
+    const int flags = ::fcntl(fd.get(), F_GETFL);
+    if (flags < 0 || ::fcntl(fd.get(), F_SETFL, flags & ~O_NONBLOCK) != 0)
+        throw tool_error(system_error("cannot read", path));
+    return fd;
+}
+
+std::vector<unsigned char> read_file(const std::string &path) {
+    struct stat st {};
+    const unique_fd fd = open_regular_file(path, st);
     if (static_cast<unsigned long long>(st.st_size) > max_file_size)
         throw tool_error(path + " is too large for an ACL buffer");
     std::vector<unsigned char> bytes(static_cast<std::size_t>(st.st_size));
@@ -75,22 +87,30 @@ std::vector<unsigned char> read_file(const std::string &path) {
     return bytes;
 }
 
-// The mode of a new file: that of the file it replaces, else 0644 less the
-// process's umask.
+// The mode of a file that replaces path: that of the file it replaces, else
+// 0644 less the process's umask. Only a file of the running user's own
+// passes on its set-user-id, set-group-id and sticky bits: nobody gets a
+// set-id file of the tool's user (root, often) by leaving such bits on a
+// file of theirs. Anything but a regular file at path is not replaced.
 mode_t mode_for(const std::string &path) {
     struct stat st {};
-    if (::stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode))
-        return st.st_mode & 07777;
-    const mode_t mask = ::umask(0);
-    ::umask(mask);
-    return 0644 & ~mask;
+    if (::lstat(path.c_str(), &st) != 0) {
+        if (errno != ENOENT)
+            throw tool_error(system_error("cannot examine", path));
+        const mode_t mask = ::umask(0);
+        ::umask(mask);
+        return 0644 & ~mask;
+    }
+    if (!S_ISREG(st.st_mode))
+        throw tool_error(path + " is not a regular file: it is not replaced");
+    return st.st_mode & (st.st_uid == ::geteuid() ? 07777 : 0777);
 }
 
 // A temporary file beside its target, removed unless it was renamed.
 class temp_file {
   public:
     explicit temp_file(const std::string &target) : name_(target + ".XXXXXX") {
-        fd_ = ::mkostemp(name_.data(), O_CLOEXEC);
+        fd_ = ::mkostemp(name_.data(), O_CLOEXEC | O_NOCTTY);
         if (fd_ < 0)
             throw tool_error(system_error("cannot create a temporary file for", target));
     }
@@ -149,9 +169,12 @@ void load_templates(const invocation &inv, template_set &set) {
 }
 
 bool looks_like_buffer(const std::string &path) {
-    unique_fd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK));
+    struct stat st {};
+    if (::lstat(path.c_str(), &st) != 0)
+        return false; // the library reports what is wrong with the name
+    const unique_fd fd = open_regular_file(path, st);
     unsigned char first = 0;
-    return fd.get() >= 0 && ::read(fd.get(), &first, 1) == 1 && first == buffer_type_byte;
+    return ::read(fd.get(), &first, 1) == 1 && first == buffer_type_byte;
 }
 
 void load_buffer_file(const std::string &path, acl_buffer &acl) {

@@ -260,8 +260,9 @@ trace_file open_trace_file() {
     const char *path = std::getenv("KX_TRACE_FILE");
     if (!path || !*path)
         return {false, -1};
-    // O_NONBLOCK: a FIFO without a reader must not hang the first trace point.
-    constexpr int flags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NONBLOCK;
+    // O_NONBLOCK: a FIFO without a reader must not hang the first trace point;
+    // O_NOCTTY: a terminal named there must not become the process's own.
+    constexpr int flags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOCTTY | O_NONBLOCK;
     int fd;
     do
         fd = open(path, flags, 0644);

@@ -4,6 +4,9 @@
 // for ThreadSanitizer as well as plain runs.
 #include <atomic>
 #include <cstdio>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 #include <string>
 #include <thread>
 #include <vector>
@@ -130,6 +133,69 @@ TEST(ReadAclFileThreads, ReadersListersAndEvaluatorsWhileTheFileIsRewritten) {
     EXPECT_EQ(failures.load(), 0) << (failure_noted ? first_failure : "");
     for (const std::string &name : dir_entries(d.dir))
         EXPECT_TRUE(name == "acl" || name == "acl.cacl") << name;
+}
+
+// A local user's race against a reader that caches: the ACL file's name, a
+// symbolic link in the user's directory, flips between root's ACL file and
+// the user's own while readers read it with the cache flag. Every CACL file
+// that a reader leaves must hold the bytes compiled from the file whose
+// owner it carries; it is removed after the check so that more get written.
+// The cycle is bounded by the readers' count of reads.
+TEST(ReadAclFileThreads, CacheOfAFlippedNameHoldsTheBytesOfTheFileWhoseOwnerItCarries) {
+    KXTEST_REQUIRE_ROOT();
+    acl_dir root_file(text_a);
+    acl_dir user_dir(text_b, 0600);
+    ASSERT_EQ(chown(user_dir.acl.c_str(), 1, 1), 0);
+    std::string acl_a, acl_b;
+    {
+        acl_read a(root_file.acl, TEXT), b(user_dir.acl, TEXT);
+        acl_a = a.bytes();
+        acl_b = b.bytes();
+    }
+    const std::string name = user_dir.dir + "/flipped", cacl = name + ".cacl";
+    ASSERT_EQ(symlink(root_file.acl.c_str(), name.c_str()), 0);
+
+    std::atomic<int> readers_left{3}, forged{0}, failed{0}, checked{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 3; ++t)
+        threads.emplace_back([&] {
+            for (int i = 0; i < 300; ++i) {
+                acl_read r(name, CACHE);
+                if (r.status != SEC_S_OK && last_error().msg_num != kxacl::MSG_2650_139)
+                    ++failed;
+                int fd = open(cacl.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC);
+                if (fd < 0)
+                    continue;
+                struct stat st;
+                std::string bytes(4096, '\0');
+                ssize_t n = fstat(fd, &st) == 0 ? read(fd, bytes.data(), bytes.size()) : -1;
+                close(fd);
+                bytes.resize(n > 0 ? static_cast<std::size_t>(n) : 0);
+                // Empty: the writer's place holder, which no reader trusts.
+                if (bytes.empty())
+                    continue;
+                ++checked;
+                if (bytes != (st.st_uid == 0 ? acl_a : acl_b))
+                    ++forged;
+                unlink(cacl.c_str());
+            }
+            --readers_left;
+        });
+    threads.emplace_back([&] {
+        const std::string staged = user_dir.dir + "/staged";
+        for (int i = 0; readers_left > 0 && i < 1000000; ++i) {
+            unlink(staged.c_str());
+            if (symlink(i % 2 ? user_dir.acl.c_str() : root_file.acl.c_str(), staged.c_str()) !=
+                    0 ||
+                rename(staged.c_str(), name.c_str()) != 0)
+                ++failed;
+        }
+    });
+    for (std::thread &t : threads)
+        t.join();
+    EXPECT_GT(checked.load(), 0);
+    EXPECT_EQ(forged.load(), 0);
+    EXPECT_EQ(failed.load(), 0);
 }
 
 } // namespace

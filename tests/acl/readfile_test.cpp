@@ -34,9 +34,9 @@ using kxtest::example_acl;
 using kxtest::hex_of;
 using kxtest::hex_text;
 using kxtest::last_error;
+using kxtest::record_is;
 using kxtest::TEXT;
 using kxtest::unset;
-using kxtest::record_is;
 using names = std::vector<std::string>;
 using items = std::vector<std::string>;
 
@@ -239,6 +239,10 @@ TEST(ReadAclFileCache, CaclFilesThatAreNotTrusted) {
         {"the other byte order, converted with 0x4", [&](const acl_dir &d) {
              kxtest::write_file(d.cacl, swapped);
          }, CONVERT, example_acl(), CONVERT, swapped},
+        {"hard-linked from elsewhere", [&](const acl_dir &d) {
+             garbage(d);
+             ASSERT_EQ(link(d.cacl.c_str(), (d.dir + "/elsewhere").c_str()), 0);
+         }, 0, example_acl(), TEXT, "garbage"},
         {"a symbolic link, never followed", [](const acl_dir &d) {
              kxtest::write_file(d.dir + "/target", "n r\n"); // newer, same owner and mode
              ASSERT_EQ(symlink((d.dir + "/target").c_str(), d.cacl.c_str()), 0);

@@ -4,6 +4,8 @@
 #include <nlohmann/json.hpp>
 
 #include <sys/stat.h>
+#include <tuple>
+#include <vector>
 
 #include "file_helpers.h"
 #include "run_kxacl.h"
@@ -228,6 +230,35 @@ TEST_F(KxaclTool, EditingNeverTouchesACachedFileInPlace) {
     ASSERT_EQ(r.exit_code, 0) << r.err;
     EXPECT_EQ(kxtest::read_file(cacl), before);
     EXPECT_EQ(run_kxacl({"check", dir + "/edited.buf", "--anyother"}).exit_code, 1);
+}
+
+// A FIFO, a device or a directory is neither read (a FIFO would hang the
+// tool) nor replaced.
+TEST_F(KxaclTool, OnlyRegularFilesAreReadOrReplaced) {
+    const std::string fifo = dir + "/fifo";
+    ASSERT_EQ(::mkfifo(fifo.c_str(), 0644), 0);
+    const std::vector<std::vector<std::string>> runs = {
+        {"list", "--buffer", fifo},         {"list", fifo},
+        {"list", acl, "--templates", fifo}, {"check", "/dev/null", "--anyother"},
+        {"compile", acl, "-o", fifo},       {"compile", acl, "-o", dir}};
+    for (const auto &args : runs) {
+        auto r = run_kxacl(args);
+        EXPECT_EQ(r.exit_code, 2) << args.back();
+        EXPECT_NE(r.err.find("is not a regular file"), std::string::npos) << r.err;
+    }
+}
+
+// A buffer file rewritten by root keeps the set-id and sticky bits only when
+// it was root's own.
+TEST_F(KxaclTool, EditingKeepsSetIdBitsOnlyOfTheRunningUsersFiles) {
+    KXTEST_REQUIRE_ROOT();
+    const std::string buf = compiled();
+    for (auto [owner, mode, kept] : {std::tuple{1u, 06777u, 0777u}, {0u, 04750u, 04750u}}) {
+        ASSERT_EQ(::chown(buf.c_str(), owner, owner), 0);
+        ASSERT_EQ(::chmod(buf.c_str(), mode), 0);
+        ASSERT_EQ(run_kxacl({"add", buf, "--group", "g" + std::to_string(owner)}).exit_code, 0);
+        EXPECT_EQ(kxtest::status_of(buf).st_mode & 07777, kept) << std::oct << mode;
+    }
 }
 
 TEST_F(KxaclTool, AddRefusesATextFileAndReportsLibraryFailures) {

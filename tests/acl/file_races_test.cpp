@@ -1,0 +1,304 @@
+// Reading ACL files against a local user who races the reader: the name
+// given to another file between the reader's own steps, a terminal swapped
+// in, a cached file hard-linked from elsewhere; and texts of any size,
+// which are read through a window of whole lines.
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <fcntl.h>
+#include <functional>
+#include <pwd.h>
+#include <string>
+#include <vector>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <kx_acl.h>
+
+#include "convert.h"
+#include "file_helpers.h"
+#include "messages.h"
+#include "parse.h"
+#include "support.h"
+#include "syscalls.h"
+#include "tree.h"
+
+using namespace kxacl;
+using namespace kxtest;
+using namespace std::string_literals;
+
+namespace {
+
+// ---- texts through the window ---------------------------------------------
+
+// What a text comes to: the status, the message (with its line) and the bytes.
+struct compiled_text {
+    kx_int32_t status;
+    std::string message;
+    std::string bytes;
+    bool operator==(const compiled_text &) const = default;
+};
+
+void PrintTo(const compiled_text &c, std::ostream *os) {
+    *os << c.status << " " << c.message << " " << hex_of(c.bytes.data(), c.bytes.size());
+}
+
+// Compiles the whole text held in memory, line by line: the reference for
+// the same text read from a file.
+compiled_text compile_in_memory(std::string text) {
+    text.push_back('\0');
+    char *cursor = text.data();
+    std::size_t remaining = text.size();
+    int lineno = 1;
+    sec_acltree_t *trees = nullptr;
+    int count = 0;
+    kx_int32_t rc;
+    sec_acle_desc entry{};
+    while ((rc = sec__read_acle_from_text(nullptr, &cursor, &remaining, &lineno, &entry)) == 1)
+        if (entry.type != 0 && (rc = sec__add_acle_to_trees(&entry, &trees, &count)) != SEC_S_OK)
+            break;
+    sec_buffer_s acl{0, nullptr};
+    if (rc == 0 && count > 0)
+        rc = sec__acltrees_to_acl(trees, count, &acl);
+    free_acltrees(trees, count);
+    compiled_text out{
+        rc, rc == 0 ? "" : last_error().text,
+        std::string(static_cast<char *>(acl.value), static_cast<std::size_t>(acl.length))};
+    std::free(acl.value);
+    return out;
+}
+
+compiled_text compile_file(const std::string &text) {
+    acl_dir d(text);
+    acl_read r(d.acl, TEXT);
+    return {r.status, r.status == 0 ? "" : last_error().text, r.bytes()};
+}
+
+// Comment lines of exactly n bytes in all (n >= 2).
+std::string padding(std::size_t n) {
+    std::string pad;
+    while (n - pad.size() > 1000)
+        pad += "#" + std::string(998, 'p') + "\n";
+    return pad + "#" + std::string(n - pad.size() - 2, 'p') + "\n";
+}
+
+std::string users(int n) {
+    std::string text;
+    for (int i = 0; i < n; ++i)
+        text += "u unix user" + std::to_string(i) + "@h rw\n";
+    return text;
+}
+
+constexpr std::size_t window = 64 * 1024;
+
+TEST(ReadAclFileText, AnyTextReadsAsItCompilesInMemory) {
+    const std::string long_line = "#" + std::string(1094, 'x') + "\n"; // 1096 bytes
+    const std::string texts[] = {
+        "o r\nu unix bob rw", // the last line has no line end
+        users(4000) + "g last r",
+        padding(window - 500) + long_line + "g staff r\n",
+        padding(window - 500) + "#x" + long_line + "g staff r\n", // 1097 bytes: 2650-158
+        std::string(70000, 'a') + "\n",                           // one line fills the window
+        padding(window + 10) + "\0o r\n\0"s,                      // a NUL ends the text
+        padding(window - 2) + "o r\0x\n"s + users(10),            // inside a line: 2650-144
+        padding(window + 3) + "o r\0"s,                           // NUL as the last byte
+        std::string(window - 1, '\r') + "\n\nn r\r\ng staff r",   // line ends of every kind
+        std::string(200000, '\n'),                                // nothing but line ends
+        std::string(window, ' ') + "o r\n",                       // blanks: a long line
+    };
+    for (const std::string &text : texts) {
+        SCOPED_TRACE(std::to_string(text.size()) + " bytes ending " +
+                     text.substr(text.size() - std::min<std::size_t>(text.size(), 20)));
+        EXPECT_EQ(compile_file(text), compile_in_memory(text));
+    }
+    EXPECT_NE(compile_file(texts[1]).bytes, compile_file(users(4000)).bytes);
+}
+
+TEST(ReadAclFileText, TextOverTheLimitIsRefusedUnread) {
+    acl_dir d("");
+    ASSERT_EQ(truncate(d.acl.c_str(), SEC_ACL_TEXT_MAX_SIZE + 1), 0);
+    acl_read over(d.acl, CACHE);
+    EXPECT_EQ(over.status, SEC_S_FILE_ERROR);
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_139,
+                          {0LL, SEC_ACL_TEXT_MAX_SIZE + 1LL, static_cast<long long>(EFBIG)}));
+    EXPECT_TRUE(over.empty());
+    // At the limit it is read, up to the NUL that a sparse file starts with.
+    ASSERT_EQ(truncate(d.acl.c_str(), SEC_ACL_TEXT_MAX_SIZE), 0);
+    acl_read at(d.acl, TEXT);
+    EXPECT_EQ(at.status, SEC_S_OK) << last_error().text;
+    EXPECT_TRUE(at.empty());
+}
+
+// ---- the name swapped between the reader's steps ---------------------------
+
+// Runs the function that arg points to; the hook of sys_before_nth.
+void run_swap(void *arg) {
+    (*static_cast<std::function<void()> *>(arg))();
+}
+
+// Two ACL files of different owners and modes, "mine", root's, and
+// "theirs", daemon's (uid and gid 1); the reader reads the name "acl",
+// which starts as another name of "mine".
+struct two_owners {
+    acl_dir d{"o r\n", 0644};
+    std::string mine = d.dir + "/mine", theirs = d.dir + "/theirs";
+    std::string compiled_mine = compile_in_memory("o r\n").bytes;
+    std::string compiled_theirs = compile_in_memory("o rwcx\ng staff r\n").bytes;
+    two_owners() {
+        EXPECT_EQ(link(d.acl.c_str(), mine.c_str()), 0);
+        write_file(theirs, "o rwcx\ng staff r\n", 0600);
+        EXPECT_EQ(chown(theirs.c_str(), 1, 1), 0);
+        shift_mtime(theirs, -20);
+    }
+    // Gives the name "acl" to another file: one of the two, or a FIFO, a
+    // terminal-like device, a directory.
+    void swap_in(const std::string &what) const {
+        std::string staged = d.dir + "/staged";
+        int made = what == "mine"     ? link(mine.c_str(), staged.c_str())
+                   : what == "theirs" ? link(theirs.c_str(), staged.c_str())
+                   : what == "FIFO"   ? mkfifo(staged.c_str(), 0644)
+                   : what == "device" ? symlink("/dev/null", staged.c_str())
+                                      : mkdir(staged.c_str(), 0755) | unlink(d.acl.c_str());
+        ASSERT_EQ(made, 0) << what;
+        ASSERT_EQ(rename(staged.c_str(), d.acl.c_str()), 0);
+    }
+    // A CACL file left behind holds the bytes compiled from the very file
+    // whose owner, group and mode it carries.
+    void expect_honest_cacl() const {
+        if (!exists(d.cacl))
+            return;
+        struct stat st = status_of(d.cacl);
+        std::string bytes = read_file(d.cacl);
+        if (st.st_uid == 0)
+            EXPECT_TRUE(bytes == compiled_mine && st.st_gid == 0 && (st.st_mode & 07777) == 0644);
+        else
+            EXPECT_TRUE(bytes == compiled_theirs && st.st_uid == 1 && st.st_gid == 1 &&
+                        (st.st_mode & 07777) == 0600);
+    }
+};
+
+// One swap of the name, just before the reader's call of a kind numbered
+// nth (counted from the previous swap).
+struct swap_step {
+    sys_call call;
+    long nth;
+    const char *swapped;
+};
+
+TEST(ReadAclFileRaces, NameGivenToAnotherFileBetweenTheReadersSteps) {
+    KXTEST_REQUIRE_ROOT();
+    enum class ends { mine, theirs, refused };
+    // open 0 is the CACL file's (absent), open 1 the text's; lstat 0 the
+    // writer's first look at the CACL name, stat 1 its last look at the ACL
+    // file's name, before the rename.
+    const swap_step before_open = {sys_call::open, 1, "theirs"};
+    struct {
+        const char *what;
+        std::vector<swap_step> swaps;
+        ends result;
+        bool cached;
+    } cases[] = {
+        {"before the open", {before_open}, ends::theirs, true},
+        {"FIFO before the open", {{sys_call::open, 1, "FIFO"}}, ends::refused, false},
+        {"device before the open", {{sys_call::open, 1, "device"}}, ends::refused, false},
+        {"directory before the open", {{sys_call::open, 1, "directory"}}, ends::refused, false},
+        {"after the compile", {{sys_call::lstat, 0, "theirs"}}, ends::mine, false},
+        {"before the last look", {{sys_call::stat, 1, "theirs"}}, ends::mine, false},
+        {"at the rename", {{sys_call::rename, 0, "theirs"}}, ends::mine, true},
+        // The forged cache: their text compiled, then the name back at mine
+        // while the cache is written.
+        {"flipped for the open and back",
+         {before_open, {sys_call::lstat, 0, "mine"}},
+         ends::theirs,
+         false},
+        {"flipped for the open and back at the rename",
+         {before_open, {sys_call::rename, 0, "mine"}},
+         ends::theirs,
+         true},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.what);
+        two_owners files;
+        std::size_t next = 0;
+        std::function<void()> swap = [&] {
+            files.swap_in(c.swaps[next++].swapped);
+            if (next < c.swaps.size())
+                sys_before_nth(c.swaps[next].call, c.swaps[next].nth, run_swap, &swap);
+        };
+        sys_before_nth(c.swaps[0].call, c.swaps[0].nth, run_swap, &swap);
+        acl_read r(files.d.acl, CACHE);
+        EXPECT_EQ(next, c.swaps.size());
+        sys_fail_nth(sys_call::open, -1, 0);
+        if (c.result == ends::refused) {
+            EXPECT_EQ(r.status, SEC_S_NO_ACL_FILE);
+            EXPECT_EQ(last_error().msg_num, MSG_2650_135);
+            EXPECT_TRUE(r.empty());
+        } else {
+            ASSERT_EQ(r.status, SEC_S_OK) << last_error().text;
+            EXPECT_EQ(r.bytes(),
+                      c.result == ends::mine ? files.compiled_mine : files.compiled_theirs);
+            EXPECT_EQ(r.rflags, c.cached ? TEXT | CACHE : TEXT);
+        }
+        EXPECT_EQ(exists(files.d.cacl), c.cached);
+        files.expect_honest_cacl();
+        for (const auto &n : dir_entries(files.d.dir))
+            EXPECT_TRUE(n == "acl" || n == "acl.cacl" || n == "mine" || n == "theirs") << n;
+    }
+}
+
+// With a user name, the file opened must be the user's, empty or not.
+TEST(ReadAclFileRaces, AnotherUsersFileSwappedInIsRefusedEvenEmpty) {
+    KXTEST_REQUIRE_ROOT();
+    std::string home = temp_dir();
+    removed_at_end cleanup{home};
+    scoped_user user(home);
+    if (!user.ok())
+        GTEST_SKIP() << "SKIPPED: useradd failed";
+    const passwd *pw = getpwnam(user.name().c_str());
+    ASSERT_NE(pw, nullptr);
+    for (const char *theirs : {"o rwcx\n", ""}) {
+        SCOPED_TRACE(std::string("root's file: \"") + theirs + "\"");
+        write_file(home + "/acl", "o r\n");
+        ASSERT_EQ(chown((home + "/acl").c_str(), pw->pw_uid, pw->pw_gid), 0);
+        write_file(home + "/root", theirs);
+        std::function<void()> swap = [&] {
+            ASSERT_EQ(rename((home + "/root").c_str(), (home + "/acl").c_str()), 0);
+        };
+        sys_before_nth(sys_call::open, 0, run_swap, &swap); // TEXT: the text's open
+        acl_read r("acl", TEXT, user.name().c_str());
+        EXPECT_TRUE(sys_fault_fired());
+        EXPECT_EQ(r.status, SEC_S_BAD_PERMISSION);
+        EXPECT_EQ(last_error().msg_num, MSG_2650_141);
+    }
+}
+
+// A daemon without a controlling terminal opens a terminal swapped in for
+// its ACL file without acquiring it, and refuses it.
+TEST(ReadAclFileRaces, TerminalSwappedInIsNeitherAcquiredNorRead) {
+    acl_dir d;
+    pid_t pid = fork();
+    if (pid == 0) {
+        int master = posix_openpt(O_RDWR | O_NOCTTY);
+        if (setsid() < 0 || master < 0 || grantpt(master) != 0 || unlockpt(master) != 0)
+            _exit(10);
+        std::string staged = d.dir + "/tty";
+        if (symlink(ptsname(master), staged.c_str()) != 0)
+            _exit(11);
+        std::function<void()> swap = [&] { rename(staged.c_str(), d.acl.c_str()); };
+        sys_before_nth(sys_call::open, 0, run_swap, &swap);
+        acl_read r(d.acl, TEXT);
+        if (!sys_fault_fired() || r.status != SEC_S_NO_ACL_FILE)
+            _exit(12);
+        // Without a controlling terminal, there is none to open.
+        _exit(open("/dev/tty", O_RDONLY | O_NOCTTY) < 0 ? 0 : 13);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+}
+
+} // namespace
