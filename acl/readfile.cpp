@@ -195,7 +195,9 @@ int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
     return std::exchange(file.fd, -1);
 }
 
-// Reads the trusted CACL file open as fd, whose status is cacl_st: its
+// Reads the trusted CACL file open as fd, whose status is cacl_st, a
+// regular file: O_NONBLOCK, which it was opened with, changes nothing for
+// its read, and a read that fails would only mean compiling. Its
 // bytes become the ACL buffer, passed through sec_convert_acl_to_host when
 // the caller asks. False, with the error record cleared and acl empty,
 // when the text must be compiled instead: the CACL file is optional, and
@@ -204,10 +206,6 @@ bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
     descriptor file{fd};
     if (info_traced())
         trace_data(121, text(c.caclpath));
-    if (sys_clear_nonblock(fd) != 0) {
-        cu_set_no_error_1();
-        return false;
-    }
     perf_timer timer(perf_at(1));
     acl__lock_acl_file(c.caclpath, fd, 1);
     char *bytes = nullptr;

@@ -234,7 +234,6 @@ TEST(SyscallFailure, ReadingTheCaclFile) {
                            {{sys_call::stat, {no_file}},
                             {sys_call::open, {text_only}},
                             {sys_call::fstat, {text_only}},
-                            {sys_call::fcntl, {text_only}},
                             {sys_call::read, {text_only}},
                             {sys_call::close, {gives(CONVERT)}}});
 }
