@@ -145,7 +145,7 @@ kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
 // The window of a text_reader: large enough for many lines per read, and
 // always for more than the longest line, so that a window full of one
 // line proves that line too long.
-constexpr std::size_t text_window_size = 64 * 1024;
+constexpr std::size_t text_window_size = std::size_t{64} * 1024;
 static_assert(text_window_size > max_line_length);
 
 } // namespace
