@@ -278,6 +278,8 @@ kx_int32_t text_reader::next(text_run *run) {
             *run = {window_, static_cast<std::size_t>(nul - window_) + 2, true};
             return SEC_S_OK;
         }
+        if (read_ == size_)
+            continue; // all of it is in: one final run
         for (std::size_t end = held_; end > scanned; --end) {
             if (ends_line(window_[end - 1])) {
                 consumed_ = end;
