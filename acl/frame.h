@@ -52,6 +52,8 @@ constexpr item_kinds operator+(item_kinds list, kx_acl_trace_item_kind kind) {
 // A row of the table as a type: trace<P>() checks its items against it.
 template <kx_acl_trace_point P> struct point_row;
 
+// The table passes items through other macros: they must stay unparenthesised.
+// NOLINTBEGIN(bugprone-macro-parentheses)
 #define KXACL_ITEM_KIND(kind, name) +(kind)
 #define KXACL_POINT_ROW(row, id_, category_, level_, rule_, where, event, items_)                  \
     template <> struct point_row<KX_ACL_TP_##row> {                                                \
@@ -59,9 +61,9 @@ template <kx_acl_trace_point P> struct point_row;
         static constexpr kx_acl_trace_category category = category_;                               \
         static constexpr tr_detail_level_t level = level_;                                         \
         static constexpr kx_acl_trace_rule rule = rule_;                                           \
-        static constexpr item_kinds items = item_kinds {}                                          \
-        items_;                                                                                    \
+        static constexpr item_kinds items = (item_kinds {} items_);                                \
     };
+// NOLINTEND(bugprone-macro-parentheses)
 KX_ACL_TRACE_POINTS(KXACL_POINT_ROW, KXACL_ITEM_KIND)
 #undef KXACL_POINT_ROW
 #undef KXACL_ITEM_KIND

@@ -26,7 +26,7 @@ namespace kxtool {
 namespace {
 
 // How long --follow waits at the end of the file before looking again.
-constexpr long follow_pause_ns = 200 * 1000 * 1000;
+constexpr long follow_pause_ns = 200'000'000;
 
 // The permission character of each bit under the invocation's templates,
 // as the library translates it.
