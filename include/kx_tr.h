@@ -5,10 +5,15 @@
  *
  * Configuration, read when a component registers:
  * - KX_TRACE_LEVELS: levels per component and category, for example
- *   "_SEL:API=8,Perf=2;_XYZ:*=1". Components are separated by ';',
- *   categories by ','; a category is named by its name (case-insensitive) or
- *   "*" for all of them; levels are 0 to 9. Unknown names and malformed parts
- *   are ignored. Categories not named keep their default level.
+ *   "_SEL:API=8,Perf=2;_XYZ:all=1". Components are separated by ';',
+ *   categories by ','; a component is named exactly, a category by its name
+ *   in any case, or "all" (or "*") for all of them; levels are 0 to 9 (more
+ *   counts as 9). Later settings override earlier ones; categories not named
+ *   keep their default level. A part that cannot be read (no component, no
+ *   "=", a level that is not a number, a category the component does not
+ *   have) is ignored with a warning on standard error that names it, at most
+ *   a few per process; settings of components never registered are not
+ *   checked for category names.
  * - KX_TRACE_FILE: the file that records are appended to. Without it records
  *   are dropped (the levels still apply, so callers still see them).
  *

@@ -20,6 +20,7 @@
 #include "acl_io.h"
 #include "json.h"
 #include "templates.h"
+#include "trace_command.h"
 
 namespace kxtool {
 namespace {
@@ -482,6 +483,8 @@ int run_command(const invocation &inv) {
         return run_dump(inv);
     case command::perms:
         return run_perms(inv);
+    case command::trace:
+        return run_trace(inv);
     case command::none:
         break;
     }

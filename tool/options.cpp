@@ -13,7 +13,7 @@ constexpr unsigned bit(command c) {
 }
 constexpr unsigned every_command = bit(command::compile) | bit(command::check) |
                                    bit(command::list) | bit(command::add) | bit(command::del) |
-                                   bit(command::dump) | bit(command::perms);
+                                   bit(command::dump) | bit(command::perms) | bit(command::trace);
 constexpr unsigned readers =
     bit(command::compile) | bit(command::check) | bit(command::list) | bit(command::dump);
 constexpr unsigned selectors = bit(command::check) | bit(command::add) | bit(command::del);
@@ -22,13 +22,14 @@ struct command_entry {
     const char *name;
     command cmd;
 };
-constexpr std::array<command_entry, 7> commands = {{{"compile", command::compile},
+constexpr std::array<command_entry, 8> commands = {{{"compile", command::compile},
                                                     {"check", command::check},
                                                     {"list", command::list},
                                                     {"add", command::add},
                                                     {"del", command::del},
                                                     {"dump", command::dump},
-                                                    {"perms", command::perms}}};
+                                                    {"perms", command::perms},
+                                                    {"trace", command::trace}}};
 
 // The state of one parse: the arguments still to read and the result.
 struct parser {
@@ -97,6 +98,14 @@ void take_string(parser &p, std::string_view opt, const std::optional<std::strin
     p.take_value(opt, v, field);
 }
 
+// An option that may be given more than once.
+void take_more(parser &p, std::string_view opt, const std::optional<std::string_view> &v,
+               std::vector<std::string> &values) {
+    if (p.take_value(opt, v, values.emplace_back()))
+        return;
+    values.pop_back();
+}
+
 constexpr std::array option_table =
     {
         option_entry{"--help", every_command, true, arity::flag,
@@ -152,6 +161,19 @@ constexpr std::array option_table =
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::string; }},
         option_entry{"--mask", bit(command::perms), false, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::mask; }},
+        option_entry{"--follow", bit(command::trace), false, arity::flag,
+                     [](parser &p, auto, auto &) { p.out.inv.trace.follow = true; }},
+        option_entry{"--pid", bit(command::trace), false, arity::value,
+                     [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.pids); }},
+        option_entry{
+            "--thread", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.threads); }},
+        option_entry{
+            "--category", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.categories); }},
+        option_entry{
+            "--point", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.points); }},
 };
 
 // --user is two options in one: the file's owner for compile, a requester
@@ -205,6 +227,10 @@ void finish(parser &p) {
         return;
     if (inv.cmd == command::none)
         return p.fail("no command given");
+    if (inv.cmd == command::trace) {
+        inv.trace.files = std::move(p.positionals);
+        return;
+    }
     // Every command takes one file or value; only perms may go without.
     const bool optional_arg = inv.cmd == command::perms;
     if (p.positionals.size() > 1)

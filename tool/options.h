@@ -11,7 +11,7 @@
 
 namespace kxtool {
 
-enum class command { none, compile, check, list, add, del, dump, perms };
+enum class command { none, compile, check, list, add, del, dump, perms, trace };
 
 // How an input file is taken: by its first byte, or as the user says.
 enum class input_kind { detect, text, buffer };
@@ -25,6 +25,14 @@ struct identity {
     char type = 0;
     std::string mech;
     std::vector<std::string> ids;
+};
+
+// trace: the files to decode and the records to show. Each filter may be
+// given more than once, each time with a comma-separated list.
+struct trace_request {
+    std::vector<std::string> files; // none, or "-": standard input
+    bool follow = false;
+    std::vector<std::string> pids, threads, categories, points;
 };
 
 struct invocation {
@@ -49,6 +57,8 @@ struct invocation {
 
     std::string perms_arg; // perms: a permission string or a mask
     perms_mode perms_as = perms_mode::detect;
+
+    trace_request trace;
 };
 
 // The parse result: the invocation, or the reason it is not one.
