@@ -86,14 +86,13 @@ kx_int32_t convert_acl_to_host(sec_boolean_t verify, sec_acl_buffer_t acl) {
     if (acl->length < 3 || !data || data[layout::at_buffer_type] != layout::buffer_type ||
         data[layout::at_version] != layout::version)
         return report<MSG_2650_109>(SEC_S_BAD_ACL);
-    bool info = trace_level(TRC_INFO) != 0;
     if (data[layout::at_byte_order] == layout::host_order) {
-        if (info)
-            trace_id(104);
+        if (wanted<KX_ACL_TP_CONVERT_HOST_ORDER>())
+            trace<KX_ACL_TP_CONVERT_HOST_ORDER>();
         return verify ? sec__check_acl_buffer(acl) : SEC_S_OK;
     }
-    if (info)
-        trace_id(106);
+    if (wanted<KX_ACL_TP_CONVERT_SWAP>())
+        trace<KX_ACL_TP_CONVERT_SWAP>();
     return reverse_fields(data, static_cast<std::size_t>(acl->length));
 }
 
@@ -124,29 +123,29 @@ extern "C" ACL_EXTERN kx_int32_t sec_create_empty_acl(sec_acl_buffer_t acl) noex
 
 extern "C" ACL_EXTERN kx_int32_t sec_read_acl_from_data(kx_int32_t length, unsigned char *buffer,
                                                         sec_acl_buffer_t acl) noexcept {
-    constexpr api_points points = api_read_acl_from_data;
-    api_enter(points, clears_record::yes,
-              [&] { trace_data(points.entry_data, num(length), num(buffer), num(acl)); });
-    return api_leave(points, read_acl_from_data(length, buffer, acl));
+    using points = api_read_acl_from_data;
+    api_enter<points>(clears_record::yes,
+                      [&] { trace<points::entry_data>(num(length), num(buffer), num(acl)); });
+    return api_leave<points>(read_acl_from_data(length, buffer, acl));
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_convert_acl_to_host(sec_boolean_t verify,
                                                          sec_acl_buffer_t acl) noexcept {
-    constexpr api_points points = api_convert_acl_to_host;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_convert_acl_to_host;
+    api_enter<points>(clears_record::yes, [&] {
         traced_descriptor d(acl);
-        trace_data(points.entry_data, num(verify), num(acl), num(d.length), num(d.value));
+        trace<points::entry_data>(num(verify), num(acl), num(d.length), num(d.value));
     });
-    return api_leave(points, convert_acl_to_host(verify, acl));
+    return api_leave<points>(convert_acl_to_host(verify, acl));
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_release_acl(sec_acl_buffer_t acl) noexcept {
-    constexpr api_points points = api_release_acl;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_release_acl;
+    api_enter<points>(clears_record::yes, [&] {
         traced_descriptor d(acl);
-        trace_data(points.entry_data, num(acl), num(d.length), num(d.value));
+        trace<points::entry_data>(num(acl), num(d.length), num(d.value));
     });
     kx_int32_t status = release_acl(acl);
-    api_leave_release(points);
+    api_leave_release<points>();
     return status;
 }

@@ -48,8 +48,8 @@ bool still_named(const char *aclfname, const struct stat &acl_st) {
 // 2650-135 when a status cannot be taken; the report names the ACL file
 // whichever file failed, the Errors point names the file that failed.
 kx_int32_t status_failed(const char *aclfname, const char *failed, int err) {
-    if (trace_level(TRC_ERRORS) != 0)
-        trace_data(109, text(failed), text("stat()"), num(err));
+    if (wanted<KX_ACL_TP_CACHE_STAT_FAILED>())
+        trace<KX_ACL_TP_CACHE_STAT_FAILED>(text(failed), text("stat()"), num(err));
     return report<MSG_2650_135>(SEC_S_FILE_ERROR, aclfname, err);
 }
 
@@ -59,19 +59,19 @@ kx_int32_t status_failed(const char *aclfname, const char *failed, int err) {
 // file type (never equal to a regular file's mode word) and is refused here.
 kx_int32_t check_existing_cacl(const char *aclfname, const char *cacl, const struct stat &acl_st,
                                const struct stat &cacl_st) {
-    bool errors = trace_level(TRC_ERRORS) != 0;
     if (!same_owner(acl_st, cacl_st)) {
-        if (errors) {
+        if (wanted<KX_ACL_TP_CACHE_OWNER_DIFFERS>()) {
             kx_uint32_t ids[4] = {acl_st.st_uid, acl_st.st_gid, cacl_st.st_uid, cacl_st.st_gid};
-            trace_data(111, text(cacl), num(ids[0]), num(ids[1]), num(ids[2]), num(ids[3]));
+            trace<KX_ACL_TP_CACHE_OWNER_DIFFERS>(text(cacl), num(ids[0]), num(ids[1]), num(ids[2]),
+                                                 num(ids[3]));
         }
         return report<MSG_2650_149>(SEC_S_FILE_ERROR, aclfname);
     }
     if (acl_st.st_mode != cacl_st.st_mode) {
-        if (errors) {
+        if (wanted<KX_ACL_TP_CACHE_MODE_DIFFERS>()) {
             kx_uint32_t modes[2] = {acl_st.st_mode & permission_bits,
                                     cacl_st.st_mode & permission_bits};
-            trace_data(111, text(cacl), num(modes[0]), num(modes[1]));
+            trace<KX_ACL_TP_CACHE_MODE_DIFFERS>(text(cacl), num(modes[0]), num(modes[1]));
         }
         return report<MSG_2650_150>(SEC_S_FILE_ERROR, aclfname);
     }
@@ -219,9 +219,9 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
         return nothing_written;
     std::size_t path_length = std::strlen(aclfname);
     if (path_length > max_cached_acl_path) {
-        if (trace_level(TRC_ERRORS) != 0) {
+        if (wanted<KX_ACL_TP_CACHE_NAME_TOO_LONG>()) {
             auto length = static_cast<kx_int32_t>(byte_count(path_length));
-            trace_data(108, text(aclfname), num(length));
+            trace<KX_ACL_TP_CACHE_NAME_TOO_LONG>(text(aclfname), num(length));
         }
         return report<MSG_2650_148>(SEC_S_FILE_ERROR, aclfname);
     }
@@ -240,8 +240,8 @@ kx_int32_t write_cacl(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t 
     if (!existed) {
         if (errno != ENOENT)
             return status_failed(aclfname, cacl, errno);
-        if (trace_level(TRC_INFO) != 0)
-            trace_data(110, text(cacl));
+        if (wanted<KX_ACL_TP_CACHE_NEW_FILE>())
+            trace<KX_ACL_TP_CACHE_NEW_FILE>(text(cacl));
     } else {
         kx_int32_t rc = check_existing_cacl(aclfname, cacl, acl_st, cacl_st);
         if (rc != SEC_S_OK)
@@ -290,8 +290,8 @@ bool cacl_name_of(const char *aclfname, char *cacl) {
 kx_int32_t cache_aclbuffer(const char *aclfname, sec_acl_buffer_t acl, sec_boolean_t force,
                            const struct stat *compiled_from) {
     kx_int32_t rc = write_cacl(aclfname, acl, force, compiled_from);
-    if (rc != SEC_S_OK && trace_level(TRC_INFO) == 1)
-        trace_data(107, text(aclfname));
+    if (rc != SEC_S_OK && wanted<KX_ACL_TP_CACHE_NOT_WRITTEN>())
+        trace<KX_ACL_TP_CACHE_NOT_WRITTEN>(text(aclfname));
     return rc;
 }
 

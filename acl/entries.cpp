@@ -248,35 +248,34 @@ using namespace kxacl;
 extern "C" ACL_EXTERN kx_int32_t sec_create_acle(unsigned char type, kx_uint32_t perm,
                                                  const char *mech, const char *id,
                                                  sec_acle_t *acle) noexcept {
-    constexpr api_points points = api_create_acle;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_create_acle;
+    api_enter<points>(clears_record::yes, [&] {
         kx_uint32_t wide_type = type;
-        trace_data(points.entry_data, num(wide_type), num(perm), text(mech), text(id), num(acle));
+        trace<points::entry_data>(num(wide_type), num(perm), text(mech), text(id), num(acle));
     });
-    return api_leave(points, create_acle(type, perm, mech, id, acle));
+    return api_leave<points>(create_acle(type, perm, mech, id, acle));
 }
 
 extern "C" ACL_EXTERN void sec_release_acle(sec_acle_t acle) noexcept {
-    constexpr api_points points = api_release_acle;
-    api_enter(points, clears_record::no, [&] {
+    using points = api_release_acle;
+    api_enter<points>(clears_record::no, [&] {
         sec_acle_desc e = traced_acle(acle);
-        trace_data(points.entry_data, num(acle), num(e.type), num(e.perm), text(e.mech),
-                   text(e.id));
+        trace<points::entry_data>(num(acle), num(e.type), num(e.perm), text(e.mech), text(e.id));
     });
     release_acle(acle);
-    api_leave_release(points);
+    api_leave_release<points>();
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_display_acle_id(sec_acle_t acle, char **mech,
                                                      char **id) noexcept {
-    constexpr api_points points = api_display_acle_id;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_display_acle_id;
+    api_enter<points>(clears_record::yes, [&] {
         sec_acle_desc e = traced_acle(acle);
         kx_uint32_t wide_type = e.type;
-        trace_data(points.entry_data, num(acle), num(wide_type), num(e.perm), text(e.mech),
-                   text(e.id), num(mech), num(id));
+        trace<points::entry_data>(num(acle), num(wide_type), num(e.perm), text(e.mech), text(e.id),
+                                  num(mech), num(id));
     });
     kx_int32_t status = display_acle_id(acle, mech, id);
-    return api_leave(points, status,
-                     [&] { trace_data(points.exit_ok, num(status), text(*mech), text(*id)); });
+    return api_leave<points>(status,
+                             [&] { trace<points::exit_ok>(num(status), text(*mech), text(*id)); });
 }

@@ -371,61 +371,55 @@ kx_int32_t group_acles_perm(sec_acl_buffer_t acl, kx_int32_t count, sec_buffer_t
     return SEC_S_OK;
 }
 
-// ---- Perf trace points -----------------------------------------------------
-
-constexpr kx_uint32_t perf_single_acle_perm = 7;
-constexpr kx_uint32_t perf_group_acles_perm = 8;
-constexpr int perf_evaluation_level = 2;
-
 } // namespace
 
 // ---- exported functions ----------------------------------------------------
 
 extern "C" ACL_EXTERN kx_int32_t sec__register_id_handler(kx_uint32_t type, const char *mech,
                                                           sec_acl_id_handler handler) noexcept {
-    constexpr api_points points = api_register_id_handler;
-    api_enter(points, clears_record::yes,
-              [&] { trace_data(points.entry_data, num(type), text(mech), num(handler)); });
-    return api_leave(points, register_id_handler(type, mech, handler));
+    using points = api_register_id_handler;
+    api_enter<points>(clears_record::yes,
+                      [&] { trace<points::entry_data>(num(type), text(mech), num(handler)); });
+    return api_leave<points>(register_id_handler(type, mech, handler));
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec__single_acle_perm(sec_acl_buffer_t acl, unsigned char type,
                                                        char *mech, char *zmech, char *id,
                                                        kx_uint32_t *perm) noexcept {
-    constexpr api_points points = api_single_acle_perm;
+    using points = api_single_acle_perm;
     kx_uint32_t wide_type = type;
-    api_enter(points, clears_record::yes, [&] {
+    api_enter<points>(clears_record::yes, [&] {
         traced_descriptor d(acl);
-        trace_data(points.entry_data, num(acl), num(d.length), num(d.value), num(wide_type),
-                   text(mech), text(id), num(perm));
+        trace<points::entry_data>(num(acl), num(d.length), num(d.value), num(wide_type), text(mech),
+                                  text(id), num(perm));
     });
-    perf_timer timer(perf_at(perf_evaluation_level));
+    perf_timer timer(wanted<KX_ACL_TP_SINGLE_ACLE_PERM_TIMED>());
     std::uint32_t searched = 0;
     kx_int32_t status = single_acle_perm(acl, type, mech, zmech, id, perm, &searched);
     if (timer.wanted()) {
         perf_elapsed t = timer.elapsed();
-        trace_data(perf_single_acle_perm, num(searched), num(wide_type), text(mech), text(id),
-                   num(t.ticks), num(t.seconds), num(t.nanoseconds));
+        trace<KX_ACL_TP_SINGLE_ACLE_PERM_TIMED>(num(searched), num(wide_type), text(mech), text(id),
+                                                num(t.ticks), num(t.seconds), num(t.nanoseconds));
     }
-    return api_leave(points, status, [&] { trace_data(points.exit_ok, num(status), num(*perm)); });
+    return api_leave<points>(status, [&] { trace<points::exit_ok>(num(status), num(*perm)); });
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec__group_acles_perm(sec_acl_buffer_t acl, kx_int32_t count,
                                                        sec_buffer_t groups,
                                                        kx_uint32_t *perm) noexcept {
-    constexpr api_points points = api_group_acles_perm;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_group_acles_perm;
+    api_enter<points>(clears_record::yes, [&] {
         traced_descriptor d(acl);
-        trace_data(points.entry_data, num(acl), num(d.length), num(d.value), num(count),
-                   num(groups), num(perm));
+        trace<points::entry_data>(num(acl), num(d.length), num(d.value), num(count), num(groups),
+                                  num(perm));
     });
-    perf_timer timer(perf_at(perf_evaluation_level));
+    perf_timer timer(wanted<KX_ACL_TP_GROUP_ACLES_PERM_TIMED>());
     kx_int32_t status = group_acles_perm(acl, count, groups, perm);
     if (timer.wanted()) {
         perf_elapsed t = timer.elapsed();
-        trace_data(perf_group_acles_perm, num(t.ticks), num(t.seconds), num(t.nanoseconds));
+        trace<KX_ACL_TP_GROUP_ACLES_PERM_TIMED>(num(t.ticks), num(t.seconds), num(t.nanoseconds));
     }
-    return api_leave(points, status, [&] { trace_data(points.exit_ok, num(status), num(*perm)); });
+    return api_leave<points>(status, [&] { trace<points::exit_ok>(num(status), num(*perm)); });
 }
 
 } // namespace kxacl

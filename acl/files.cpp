@@ -87,21 +87,21 @@ kx_int32_t path_from_working_dir(const char *filename, char *aclfname) {
     return SEC_S_OK;
 }
 
-// Runs read() and records its time at Perf level 2 (point 6).
+// Runs read() and records its time in its Perf point.
 template <typename Read> kx_int32_t timed_read(Read read) {
-    perf_timer timer(perf_at(2));
+    perf_timer timer(wanted<KX_ACL_TP_READ_BYTES>());
     kx_int32_t rc = read();
     if (timer.wanted()) {
         perf_elapsed e = timer.elapsed();
-        trace_data(6, num(e.ticks), num(e.seconds), num(e.nanoseconds));
+        trace<KX_ACL_TP_READ_BYTES>(num(e.ticks), num(e.seconds), num(e.nanoseconds));
     }
     return rc;
 }
 
 // 2650-102 for the bytes asked for to read a file of size bytes.
 kx_int32_t no_memory_for(const char *aclfname, std::uint64_t size, std::size_t asked) {
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(125, text(aclfname), num(size));
+    if (wanted<KX_ACL_TP_READ_NO_MEMORY>())
+        trace<KX_ACL_TP_READ_NO_MEMORY>(text(aclfname), num(size));
     return no_memory("sec_read_acl_file", asked);
 }
 
@@ -145,22 +145,22 @@ kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
 // The window of a text_reader: large enough for many lines per read, and
 // always for more than the longest line, so that a window full of one
 // line proves that line too long.
-constexpr std::size_t text_window_size = 64 * 1024;
+constexpr std::size_t text_window_size = std::size_t{64} * 1024;
 static_assert(text_window_size > max_line_length);
 
 } // namespace
 
 // 2650-135 for a file whose status cannot be taken, with its Info point.
 kx_int32_t report_unexaminable(const char *aclfname, int err) {
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(123, text(aclfname), num(err));
+    if (wanted<KX_ACL_TP_READ_FSTAT_FAILED>())
+        trace<KX_ACL_TP_READ_FSTAT_FAILED>(text(aclfname), num(err));
     return report<MSG_2650_135>(SEC_S_FILE_ERROR, aclfname, err);
 }
 
 // 2650-139: got bytes (-1 for a read error) of a file of size bytes.
 kx_int32_t report_short_read(const char *aclfname, std::uint64_t size, std::int64_t got, int err) {
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(127, text(aclfname), num(size), num(got));
+    if (wanted<KX_ACL_TP_READ_SHORT>())
+        trace<KX_ACL_TP_READ_SHORT>(text(aclfname), num(size), num(got));
     int shown = got < 0 ? -1 : byte_count(static_cast<std::size_t>(got));
     return report<MSG_2650_139>(SEC_S_FILE_ERROR, shown, byte_count(size), err);
 }

@@ -8,10 +8,10 @@ namespace kxacl {
 
 tr_detail_level_t acl__trace_detail_levels[5];
 
+#define KXACL_CATEGORY(category, name) {category, name, 0, 0},
 const tr_category_description_t acl__trace_categories[5] = {
-    {0, "Errors", 0, 0}, {1, "Info", 0, 0}, {2, "API", 0, 0},
-    {3, "Buffer", 0, 0}, {4, "Perf", 0, 0},
-};
+    KX_ACL_TRACE_CATEGORIES(KXACL_CATEGORY)};
+#undef KXACL_CATEGORY
 
 pthread_once_t acl__trace_register_once = PTHREAD_ONCE_INIT;
 cu_timeinfo_t timeinfo;
@@ -19,21 +19,6 @@ cu_timeinfo_t timeinfo;
 namespace {
 
 constexpr kx_uint32_t no_cats = sizeof acl__trace_categories / sizeof acl__trace_categories[0];
-
-// Perf levels at which registration records trace point 0.
-bool perf_level_announced(tr_detail_level_t level) {
-    switch (level) {
-    case 1:
-    case 2:
-    case 3:
-    case 4:
-    case 7:
-    case 8:
-        return true;
-    default:
-        return false;
-    }
-}
 
 kx_int32_t acl__trace_register_component() {
     assert(no_cats == sizeof(acl__trace_detail_levels) / sizeof(acl__trace_detail_levels[0]));
@@ -45,9 +30,10 @@ kx_int32_t acl__trace_register_component() {
     cu_pset_error_1(saved);
     cu_rel_error_1(saved);
     cu_get_procspeed_1(&timeinfo);
-    kx_int32_t perf = trace_level(TRC_PERF);
-    if (perf_level_announced(static_cast<tr_detail_level_t>(perf)))
-        trace_data(0, num(perf));
+    if (wanted<KX_ACL_TP_PERF_LEVEL>()) {
+        kx_int32_t perf = trace_level(KX_TRC_PERF);
+        trace<KX_ACL_TP_PERF_LEVEL>(num(perf));
+    }
     return rc;
 }
 

@@ -6,24 +6,18 @@
 
 #include <cstring>
 #include <tuple>
+#include <type_traits>
+#include <utility>
 #include <pthread.h>
 
+#include <kx_acl_trace.h>
 #include <kx_cu.h>
 #include <kx_sec.h>
 #include <kx_tr.h>
 
 namespace kxacl {
 
-inline constexpr const char trace_component[] = "_SEL";
-
-// Trace categories of the component, in the order of their levels.
-enum trace_category : int {
-    TRC_ERRORS = 0,
-    TRC_INFO = 1,
-    TRC_API = 2,
-    TRC_BUFFER = 3,
-    TRC_PERF = 4
-};
+inline constexpr const char trace_component[] = KX_ACL_TRACE_COMPONENT;
 
 extern tr_detail_level_t acl__trace_detail_levels[5];
 extern const tr_category_description_t acl__trace_categories[5];
@@ -39,22 +33,119 @@ inline void ensure_trace_registered() {
 }
 
 // The current level of a category; the trace library may change it at any time.
-inline tr_detail_level_t trace_level(trace_category category) {
+inline tr_detail_level_t trace_level(kx_acl_trace_category category) {
     return __atomic_load_n(&acl__trace_detail_levels[category], __ATOMIC_RELAXED);
 }
 
-// One data item of a trace point: the bytes of a variable, or a text with its NUL.
-struct trace_item {
-    const void *data;
-    kx_uint32_t length;
+// ---- The rows of kx_acl_trace.h, checked at compile time ------------------
+
+// The kinds of a row's items, in order.
+struct item_kinds {
+    kx_acl_trace_item_kind kind[KX_ACL_TRACE_MAX_ITEMS] = {};
+    std::size_t count = 0;
 };
-// A pointer is recorded as its own bytes (its address), not what it points to.
-template <typename T> trace_item num(const T &value) {
-    return {&value, static_cast<kx_uint32_t>(sizeof value)}; // NOLINT(bugprone-sizeof-expression)
+constexpr item_kinds operator+(item_kinds list, kx_acl_trace_item_kind kind) {
+    list.kind[list.count++] = kind;
+    return list;
 }
-inline trace_item text(const char *s, const char *if_null = "") {
-    const char *t = s ? s : if_null;
-    return {t, static_cast<kx_uint32_t>(std::strlen(t) + 1)};
+
+// A row of the table as a type: trace<P>() checks its items against it.
+template <kx_acl_trace_point P> struct point_row;
+
+// The table passes items through other macros: they must stay unparenthesised.
+// NOLINTBEGIN(bugprone-macro-parentheses)
+#define KXACL_ITEM_KIND(kind, name) +(kind)
+#define KXACL_POINT_ROW(row, id_, category_, level_, rule_, where, event, items_)                  \
+    template <> struct point_row<KX_ACL_TP_##row> {                                                \
+        static constexpr kx_uint32_t id = id_;                                                     \
+        static constexpr kx_acl_trace_category category = category_;                               \
+        static constexpr tr_detail_level_t level = level_;                                         \
+        static constexpr kx_acl_trace_rule rule = rule_;                                           \
+        static constexpr item_kinds items = (item_kinds {} items_);                                \
+    };
+// NOLINTEND(bugprone-macro-parentheses)
+KX_ACL_TRACE_POINTS(KXACL_POINT_ROW, KXACL_ITEM_KIND)
+#undef KXACL_POINT_ROW
+#undef KXACL_ITEM_KIND
+
+// Whether a point of this rule and row level is recorded at a category level.
+constexpr bool level_records(kx_acl_trace_rule rule, tr_detail_level_t row_level,
+                             tr_detail_level_t level) {
+    switch (rule) {
+    case KX_TRL_AT_LEAST:
+        return level >= row_level;
+    case KX_TRL_EXACTLY:
+        return level == row_level;
+    case KX_TRL_ANNOUNCED:
+        return (level >= 1 && level <= 4) || level == 7 || level == 8;
+    }
+    return false;
+}
+
+// Whether point P is recorded at this level of its category.
+template <kx_acl_trace_point P> bool records_at(tr_detail_level_t level) {
+    return level_records(point_row<P>::rule, point_row<P>::level, level);
+}
+
+// Whether point P is recorded at its category's current level.
+template <kx_acl_trace_point P> bool wanted() {
+    return records_at<P>(trace_level(point_row<P>::category));
+}
+
+// One data item: the bytes of a variable (a pointer's own bytes, its
+// address, not what it points to), or a text with its NUL.
+template <typename T> struct num_item {
+    const T *value;
+    const void *data() const { return value; }
+    kx_uint32_t length() const { return sizeof(T); } // NOLINT(bugprone-sizeof-expression)
+};
+struct text_item {
+    const char *text;
+    const void *data() const { return text; }
+    kx_uint32_t length() const { return static_cast<kx_uint32_t>(std::strlen(text) + 1); }
+};
+template <typename T> num_item<T> num(const T &value) {
+    return {&value};
+}
+inline text_item text(const char *s, const char *if_null = "") {
+    return {s ? s : if_null};
+}
+
+// Whether an item may stand where the row has an item of kind K: a text for
+// a text, a pointer for a pointer, an integer of the kind's size otherwise.
+template <kx_acl_trace_item_kind K, typename Item> inline constexpr bool item_fits = false;
+template <kx_acl_trace_item_kind K>
+inline constexpr bool item_fits<K, text_item> = K == KX_TRI_TEXT;
+template <kx_acl_trace_item_kind K, typename T>
+inline constexpr bool item_fits<K, num_item<T>> = K == KX_TRI_POINTER
+                                                      ? std::is_pointer_v<T>
+                                                      : K != KX_TRI_TEXT &&std::is_integral_v<T> &&
+                                                            sizeof(T) == KX_ACL_TRACE_ITEM_SIZE(K);
+
+template <typename Row, typename... Items, std::size_t... I>
+constexpr bool items_fit(std::index_sequence<I...>) {
+    return (item_fits<Row::items.kind[I], Items> && ...);
+}
+
+// Records point P with its items, which must be those of its row.
+template <kx_acl_trace_point P, typename... Items> void trace(Items... items) {
+    using row = point_row<P>;
+    static_assert(sizeof...(Items) == row::items.count,
+                  "the number of items differs from the row's");
+    static_assert(items_fit<row, Items...>(std::index_sequence_for<Items...>{}),
+                  "an item does not match the kind of the row's item");
+    if constexpr (sizeof...(Items) == 0) {
+        tr_record_id_1(trace_component, row::id);
+    } else {
+        // The trace library takes each item as a pointer and a length.
+        auto pairs = std::tuple_cat(std::make_tuple(items.data(), items.length())...);
+        std::apply(
+            [](auto... flat) {
+                tr_record_data_1(trace_component, row::id,
+                                 static_cast<kx_uint32_t>(sizeof...(Items)), flat...);
+            },
+            pairs);
+    }
 }
 
 // The trace items of an ACL descriptor: its length and value, zero for null.
@@ -69,62 +160,62 @@ struct traced_descriptor {
     }
 };
 
-inline void trace_id(kx_uint32_t id) {
-    tr_record_id_1(trace_component, id);
-}
+// ---- The API frame ---------------------------------------------------------
 
-// Records a trace point with its items, each passed as a pointer and a length.
-template <typename... Items> void trace_data(kx_uint32_t id, Items... items) {
-    auto pairs = std::tuple_cat(std::make_tuple(items.data, items.length)...);
-    std::apply(
-        [id](auto... flat) {
-            tr_record_data_1(trace_component, id, static_cast<kx_uint32_t>(sizeof...(Items)),
-                             flat...);
-        },
-        pairs);
-}
-
-// The API trace point ids of one exported function.
+// The API points of one exported function (KX_ACL_TRACE_API and its kin).
+template <kx_acl_trace_point Entry, kx_acl_trace_point EntryData, kx_acl_trace_point Exit,
+          kx_acl_trace_point ExitFail, kx_acl_trace_point ExitOk>
 struct api_points {
-    kx_uint32_t entry;      // level 1
-    kx_uint32_t entry_data; // level 8
-    kx_uint32_t exit;       // level 1
-    kx_uint32_t exit_fail;  // level 8, failure: the status alone
-    kx_uint32_t exit_ok;    // level 8, success: the status and the function's items
+    static constexpr kx_acl_trace_point entry = Entry;          // level 1
+    static constexpr kx_acl_trace_point entry_data = EntryData; // level 8
+    static constexpr kx_acl_trace_point exit = Exit;            // level 1 (any, for releases)
+    static constexpr kx_acl_trace_point exit_fail = ExitFail;   // level 8, the status alone
+    static constexpr kx_acl_trace_point exit_ok = ExitOk;       // level 8, the function's items
 };
+#define KXACL_API(row)                                                                             \
+    api_points<KX_ACL_TP_##row##_ENTER, KX_ACL_TP_##row##_ENTER_DATA, KX_ACL_TP_##row##_EXIT,      \
+               KX_ACL_TP_##row##_EXIT_FAIL, KX_ACL_TP_##row##_EXIT_OK>
+#define KXACL_API_STATUS(row)                                                                      \
+    api_points<KX_ACL_TP_##row##_ENTER, KX_ACL_TP_##row##_ENTER_DATA, KX_ACL_TP_##row##_EXIT,      \
+               KX_ACL_TP_##row##_EXIT_DATA, KX_ACL_TP_##row##_EXIT_DATA>
+#define KXACL_API_RELEASE(row)                                                                     \
+    api_points<KX_ACL_TP_##row##_ENTER, KX_ACL_TP_##row##_ENTER_DATA, KX_ACL_TP_##row##_EXIT,      \
+               KX_ACL_TP_##row##_EXIT, KX_ACL_TP_##row##_EXIT>
 
-inline constexpr api_points api_read_acl_file{9, 11, 12, 13, 14};
-inline constexpr api_points api_read_acl_from_data{15, 17, 18, 19, 19};
-inline constexpr api_points api_list_acl{20, 24, 25, 26, 27};
-inline constexpr kx_uint32_t api_list_acl_null_entry = 22;
-inline constexpr api_points api_list_acl_by_type{28, 32, 33, 34, 35};
-inline constexpr kx_uint32_t api_list_acl_by_type_null_entry = 30;
-inline constexpr api_points api_release_aclelist{36, 38, 39, 0, 0};
-inline constexpr api_points api_create_acle{40, 42, 43, 44, 44};
-inline constexpr api_points api_release_acle{45, 47, 48, 0, 0};
-inline constexpr api_points api_display_acle_id{49, 51, 52, 53, 54};
-inline constexpr api_points api_convert_acl_to_host{55, 57, 58, 59, 59};
-inline constexpr api_points api_add_acle_to_acl{60, 62, 63, 64, 64};
-inline constexpr api_points api_del_acle_from_acl{65, 67, 68, 69, 69};
-inline constexpr api_points api_release_acl{70, 72, 73, 0, 0};
-inline constexpr api_points api_register_id_handler{74, 76, 77, 78, 78};
-inline constexpr api_points api_single_acle_perm{79, 81, 82, 83, 84};
-inline constexpr api_points api_group_acles_perm{85, 87, 88, 89, 90};
-inline constexpr api_points api_translate_perms{91, 93, 94, 95, 96};
-inline constexpr api_points api_translate_bitmask{97, 99, 100, 101, 102};
+using api_read_acl_file = KXACL_API(READ_ACL_FILE);
+using api_read_acl_from_data = KXACL_API_STATUS(READ_ACL_FROM_DATA);
+using api_list_acl = KXACL_API(LIST_ACL);
+using api_list_acl_by_type = KXACL_API(LIST_ACL_BY_TYPE);
+using api_release_aclelist = KXACL_API_RELEASE(RELEASE_ACLELIST);
+using api_create_acle = KXACL_API_STATUS(CREATE_ACLE);
+using api_release_acle = KXACL_API_RELEASE(RELEASE_ACLE);
+using api_display_acle_id = KXACL_API(DISPLAY_ACLE_ID);
+using api_convert_acl_to_host = KXACL_API_STATUS(CONVERT_ACL_TO_HOST);
+using api_add_acle_to_acl = KXACL_API_STATUS(ADD_ACLE_TO_ACL);
+using api_del_acle_from_acl = KXACL_API_STATUS(DEL_ACLE_FROM_ACL);
+using api_release_acl = KXACL_API_RELEASE(RELEASE_ACL);
+using api_register_id_handler = KXACL_API_STATUS(REGISTER_ID_HANDLER);
+using api_single_acle_perm = KXACL_API(SINGLE_ACLE_PERM);
+using api_group_acles_perm = KXACL_API(GROUP_ACLES_PERM);
+using api_translate_perms = KXACL_API(TRANSLATE_PERMS);
+using api_translate_bitmask = KXACL_API(TRANSLATE_BITMASK);
+
+#undef KXACL_API
+#undef KXACL_API_STATUS
+#undef KXACL_API_RELEASE
 
 // Whether a function clears the thread's error record on entry.
 enum class clears_record : bool { no = false, yes = true };
 
 // Entry of an exported function. At API level 8 entry_items() records the
-// entry-with-data point (it picks the id, since a few functions have two).
-template <typename EntryItems>
-void api_enter(const api_points &points, clears_record clears, EntryItems &&entry_items) {
+// entry-with-data point (it picks the point, since a few functions have two).
+template <typename Points, typename EntryItems>
+void api_enter(clears_record clears, EntryItems &&entry_items) {
     ensure_trace_registered();
-    tr_detail_level_t level = trace_level(TRC_API);
-    if (level == 1)
-        trace_id(points.entry);
-    else if (level == 8)
+    tr_detail_level_t level = trace_level(KX_TRC_API);
+    if (records_at<Points::entry>(level))
+        trace<Points::entry>();
+    else if (records_at<Points::entry_data>(level))
         entry_items();
     if (clears == clears_record::yes)
         cu_set_no_error_1();
@@ -133,15 +224,15 @@ void api_enter(const api_points &points, clears_record clears, EntryItems &&entr
 // Exit of an exported function with its status. At API level 8 a failure
 // records the status alone, a success records exit_items() (which records
 // the exit-on-success point with its items).
-template <typename ExitItems>
-kx_int32_t api_leave(const api_points &points, kx_int32_t status, ExitItems &&exit_items) {
+template <typename Points, typename ExitItems>
+kx_int32_t api_leave(kx_int32_t status, ExitItems &&exit_items) {
     ensure_trace_registered();
-    tr_detail_level_t level = trace_level(TRC_API);
-    if (level == 1) {
-        trace_id(points.exit);
-    } else if (level == 8) {
+    tr_detail_level_t level = trace_level(KX_TRC_API);
+    if (records_at<Points::exit>(level)) {
+        trace<Points::exit>();
+    } else if (records_at<Points::exit_ok>(level)) {
         if (status != 0)
-            trace_data(points.exit_fail, num(status));
+            trace<Points::exit_fail>(num(status));
         else
             exit_items();
     }
@@ -149,15 +240,15 @@ kx_int32_t api_leave(const api_points &points, kx_int32_t status, ExitItems &&ex
 }
 
 // Exit whose level-8 point carries only the status, on both outcomes.
-inline kx_int32_t api_leave(const api_points &points, kx_int32_t status) {
-    return api_leave(points, status, [&] { trace_data(points.exit_ok, num(status)); });
+template <typename Points> kx_int32_t api_leave(kx_int32_t status) {
+    return api_leave<Points>(status, [&] { trace<Points::exit_ok>(num(status)); });
 }
 
-// Exit of the release functions: the bare exit id at every non-zero level.
-inline void api_leave_release(const api_points &points) {
+// Exit of the release functions: the bare exit point at every non-zero level.
+template <typename Points> void api_leave_release() {
     ensure_trace_registered();
-    if (trace_level(TRC_API) != 0)
-        trace_id(points.exit);
+    if (wanted<Points::exit>())
+        trace<Points::exit>();
 }
 
 // Elapsed time of a measured step, as the Perf trace points record it.
@@ -178,11 +269,6 @@ class perf_timer {
     bool wanted_;
     kx_uint64_t start_;
 };
-
-// True when the Perf level is exactly level.
-inline bool perf_at(int level) {
-    return trace_level(TRC_PERF) == level;
-}
 
 } // namespace kxacl
 

@@ -323,7 +323,7 @@ kx_int32_t del_acle(sec_acle_t acle, sec_acl_buffer_t acl) {
 }
 
 // The trace items of an entry and a descriptor, as the edits record them.
-void trace_edit_entry(kx_uint32_t id, sec_acle_t acle, sec_acl_buffer_t acl) {
+template <kx_acl_trace_point P> void trace_edit_entry(sec_acle_t acle, sec_acl_buffer_t acl) {
     sec_acle_desc e{};
     if (acle) {
         e = *acle;
@@ -331,14 +331,14 @@ void trace_edit_entry(kx_uint32_t id, sec_acle_t acle, sec_acl_buffer_t acl) {
     }
     kx_uint32_t type = e.type;
     traced_descriptor d(acl);
-    trace_data(id, num(acle), num(type), num(e.perm), text(e.mech), text(e.id), num(acl),
-               num(d.length), num(d.value));
+    trace<P>(num(acle), num(type), num(e.perm), text(e.mech), text(e.id), num(acl), num(d.length),
+             num(d.value));
 }
 
 kx_int32_t add_acle_framed(sec_boolean_t noupdate, sec_acle_t acle, sec_acl_buffer_t acl) {
-    constexpr api_points points = api_add_acle_to_acl;
-    api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
-    return api_leave(points, add_acle(noupdate, acle, acl));
+    using points = api_add_acle_to_acl;
+    api_enter<points>(clears_record::yes, [&] { trace_edit_entry<points::entry_data>(acle, acl); });
+    return api_leave<points>(add_acle(noupdate, acle, acl));
 }
 
 // The list's count for trace points; 0 for a null list.
@@ -354,49 +354,49 @@ using namespace kxacl;
 
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl,
                                               sec_acle_list_t aclelist) noexcept {
-    constexpr api_points points = api_list_acl;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_list_acl;
+    api_enter<points>(clears_record::yes, [&] {
         if (acl)
-            trace_data(points.entry_data, num(acl->length), num(acl->value), num(aclelist));
+            trace<points::entry_data>(num(acl->length), num(acl->value), num(aclelist));
         else
-            trace_data(api_list_acl_null_entry, num(acl), num(aclelist));
+            trace<KX_ACL_TP_LIST_ACL_ENTER_NULL>(num(acl), num(aclelist));
     });
     kx_int32_t status = list_acl(acl, aclelist);
-    return api_leave(points, status, [&] {
+    return api_leave<points>(status, [&] {
         kx_int32_t count = list_count(aclelist);
-        trace_data(points.exit_ok, num(status), num(count));
+        trace<points::exit_ok>(num(status), num(count));
     });
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsigned char type,
                                                       char *mech,
                                                       sec_acle_list_t aclelist) noexcept {
-    constexpr api_points points = api_list_acl_by_type;
-    api_enter(points, clears_record::yes, [&] {
+    using points = api_list_acl_by_type;
+    api_enter<points>(clears_record::yes, [&] {
         kx_uint32_t wide_type = type;
         if (acl)
-            trace_data(points.entry_data, num(acl->length), num(acl->value), num(wide_type),
-                       text(mech), num(aclelist));
+            trace<points::entry_data>(num(acl->length), num(acl->value), num(wide_type), text(mech),
+                                      num(aclelist));
         else
-            trace_data(api_list_acl_by_type_null_entry, num(acl), num(wide_type), text(mech),
-                       num(aclelist));
+            trace<KX_ACL_TP_LIST_ACL_BY_TYPE_ENTER_NULL>(num(acl), num(wide_type), text(mech),
+                                                         num(aclelist));
     });
     kx_int32_t status = list_acl_by_type(acl, type, mech, aclelist);
-    return api_leave(points, status, [&] {
+    return api_leave<points>(status, [&] {
         kx_int32_t count = list_count(aclelist);
-        trace_data(points.exit_ok, num(status), num(count));
+        trace<points::exit_ok>(num(status), num(count));
     });
 }
 
 extern "C" ACL_EXTERN void sec_release_aclelist(sec_acle_list_t aclelist) noexcept {
-    constexpr api_points points = api_release_aclelist;
-    api_enter(points, clears_record::no, [&] {
+    using points = api_release_aclelist;
+    api_enter<points>(clears_record::no, [&] {
         kx_int32_t count = list_count(aclelist);
-        trace_data(points.entry_data, num(aclelist), num(count));
+        trace<points::entry_data>(num(aclelist), num(count));
     });
     if (aclelist && aclelist->count != 0 && aclelist->acles)
         release_list(aclelist);
-    api_leave_release(points);
+    api_leave_release<points>();
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_add_acle_to_acl(sec_acle_t acle,
@@ -411,7 +411,7 @@ extern "C" ACL_EXTERN kx_int32_t sec_add_acle_to_acl2(sec_acle_t acle,
 
 extern "C" ACL_EXTERN kx_int32_t sec_del_acle_from_acl(sec_acle_t acle,
                                                        sec_acl_buffer_t acl) noexcept {
-    constexpr api_points points = api_del_acle_from_acl;
-    api_enter(points, clears_record::yes, [&] { trace_edit_entry(points.entry_data, acle, acl); });
-    return api_leave(points, del_acle(acle, acl));
+    using points = api_del_acle_from_acl;
+    api_enter<points>(clears_record::yes, [&] { trace_edit_entry<points::entry_data>(acle, acl); });
+    return api_leave<points>(del_acle(acle, acl));
 }

@@ -18,8 +18,6 @@ namespace kxacl {
 
 namespace {
 
-inline constexpr kx_uint32_t trace_line_too_long = 115;
-
 // Skipped before a token. FF and CR are not: they end the line.
 bool is_blank(char c) {
     return c == ' ' || c == '\t' || c == '\v';
@@ -167,9 +165,9 @@ kx_int32_t parse_entry(line_tokens &tokens, sec_perm_set_t permset, int lineno, 
 
 kx_int32_t line_too_long(int lineno, std::size_t size) {
     ensure_trace_registered();
-    if (trace_level(TRC_ERRORS) != 0) {
+    if (wanted<KX_ACL_TP_PARSE_LINE_TOO_LONG>()) {
         kx_int32_t traced_size = byte_count(size);
-        trace_data(trace_line_too_long, num(lineno), num(traced_size));
+        trace<KX_ACL_TP_PARSE_LINE_TOO_LONG>(num(lineno), num(traced_size));
     }
     return report<MSG_2650_158>(SEC_S_FILE_ERROR, lineno);
 }

@@ -74,9 +74,9 @@ using namespace kxacl;
 
 extern "C" ACL_EXTERN kx_int32_t sec_translate_perms(const char *perms, sec_perm_set_t permset,
                                                      kx_uint32_t *bitmask) noexcept {
-    constexpr api_points points = api_translate_perms;
-    api_enter(points, clears_record::no, [&] {
-        trace_data(points.entry_data, text(perms, "<nil>"), num(permset), num(bitmask));
+    using points = api_translate_perms;
+    api_enter<points>(clears_record::no, [&] {
+        trace<points::entry_data>(text(perms, "<nil>"), num(permset), num(bitmask));
     });
     kx_int32_t status = SEC_S_OK;
     if (!bitmask) {
@@ -86,17 +86,16 @@ extern "C" ACL_EXTERN kx_int32_t sec_translate_perms(const char *perms, sec_perm
         if (perms)
             status = sec__translate_perms(perms, perm_set_or_default(permset), bitmask);
     }
-    return api_leave(points, status,
-                     [&] { trace_data(points.exit_ok, num(status), num(*bitmask)); });
+    return api_leave<points>(status, [&] { trace<points::exit_ok>(num(status), num(*bitmask)); });
 }
 
 extern "C" ACL_EXTERN kx_int32_t sec_translate_bitmask(kx_uint32_t bitmask, sec_perm_set_t permset,
                                                        char *perms) noexcept {
-    constexpr api_points points = api_translate_bitmask;
+    using points = api_translate_bitmask;
     // The caller's buffer need not hold a text on entry, so its address is
     // recorded instead of its contents.
-    api_enter(points, clears_record::no,
-              [&] { trace_data(points.entry_data, num(bitmask), num(permset), num(perms)); });
+    api_enter<points>(clears_record::no,
+                      [&] { trace<points::entry_data>(num(bitmask), num(permset), num(perms)); });
     kx_int32_t status = SEC_S_OK;
     if (!perms) {
         status = bad_param("sec_translate_mask", 3, perms);
@@ -105,6 +104,6 @@ extern "C" ACL_EXTERN kx_int32_t sec_translate_bitmask(kx_uint32_t bitmask, sec_
         if (bitmask != 0)
             status = sec__translate_bitmask(bitmask, perm_set_or_default(permset), perms);
     }
-    return api_leave(points, status,
-                     [&] { trace_data(points.exit_ok, num(status), text(perms, "<nil>")); });
+    return api_leave<points>(status,
+                             [&] { trace<points::exit_ok>(num(status), text(perms, "<nil>")); });
 }

@@ -53,13 +53,9 @@ struct read_call {
     }
 };
 
-void trace_perf(kx_uint32_t id, const char *name, const perf_timer &timer) {
+template <kx_acl_trace_point P> void trace_perf(const char *name, const perf_timer &timer) {
     perf_elapsed e = timer.elapsed();
-    trace_data(id, text(name), num(e.ticks), num(e.seconds), num(e.nanoseconds));
-}
-
-bool info_traced() {
-    return trace_level(TRC_INFO) != 0;
+    trace<P>(text(name), num(e.ticks), num(e.seconds), num(e.nanoseconds));
 }
 
 void clear_acl(sec_buffer_s *acl) {
@@ -108,13 +104,13 @@ kx_int32_t examine_acl_name(read_call &c) {
 
 // Resolves and examines the ACL file.
 kx_int32_t examine_acl_file(read_call &c) {
-    perf_timer timer(perf_at(1));
+    perf_timer timer(wanted<KX_ACL_TP_READ_RESOLVED>());
     kx_int32_t rc = sec__get_aclfname(c.filename, c.username, c.aclpath, &c.uid);
     if (rc != SEC_S_OK)
         return rc;
     rc = examine_acl_name(c);
     if (timer.wanted())
-        trace_perf(1, c.aclpath, timer);
+        trace_perf<KX_ACL_TP_READ_RESOLVED>(c.aclpath, timer);
     return rc;
 }
 
@@ -123,16 +119,16 @@ void trace_verdict(const read_call &c, const cacl_verdict &v) {
     case cacl_state::trusted:
         break;
     case cacl_state::unexaminable:
-        trace_data(118, text(c.caclpath), num(v.err));
+        trace<KX_ACL_TP_READ_CACL_UNEXAMINABLE>(text(c.caclpath), num(v.err));
         break;
     case cacl_state::stale:
-        trace_data(119, text(c.caclpath));
+        trace<KX_ACL_TP_READ_CACL_STALE>(text(c.caclpath));
         break;
     case cacl_state::foreign: {
         kx_uint32_t ids[6] = {c.acl_st.st_uid,  c.acl_st.st_gid,  v.cacl_st.st_uid,
                               v.cacl_st.st_gid, c.acl_st.st_mode, v.cacl_st.st_mode};
-        trace_data(120, text(c.aclpath), num(ids[0]), num(ids[1]), num(ids[2]), num(ids[3]),
-                   num(ids[4]), num(ids[5]));
+        trace<KX_ACL_TP_READ_CACL_FOREIGN>(text(c.aclpath), num(ids[0]), num(ids[1]), num(ids[2]),
+                                           num(ids[3]), num(ids[4]), num(ids[5]));
         break;
     }
     }
@@ -143,11 +139,11 @@ void trace_verdict(const read_call &c, const cacl_verdict &v) {
 // terminal of a daemon if a terminal did; whatever is not a regular file is
 // refused on the descriptor's status before a byte is read.
 int open_timed(const char *source, int flags) {
-    perf_timer timer(perf_at(2));
+    perf_timer timer(wanted<KX_ACL_TP_READ_OPENED>());
     int fd = sys_open(source, O_RDONLY | O_NOCTTY | O_NONBLOCK | O_CLOEXEC | flags);
     int err = errno;
     if (timer.wanted())
-        trace_perf(4, source, timer);
+        trace_perf<KX_ACL_TP_READ_OPENED>(source, timer);
     errno = err;
     return fd;
 }
@@ -173,9 +169,10 @@ struct descriptor {
 int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
     if (!cacl_name_of(c.aclpath, c.caclpath))
         return -1;
-    bool info = info_traced();
+    // One level for the check and its verdict, whose points share it.
+    bool info = wanted<KX_ACL_TP_READ_CACL_CHECK>();
     if (info)
-        trace_data(117, text(c.caclpath));
+        trace<KX_ACL_TP_READ_CACL_CHECK>(text(c.caclpath));
     descriptor file{open_timed(c.caclpath, O_NOFOLLOW)};
     cacl_verdict v{cacl_state::unexaminable, errno, {}};
     if (file.fd < 0 && v.err == ELOOP) {
@@ -204,9 +201,9 @@ int open_trusted_cacl(read_call &c, struct stat *cacl_st) {
 // nothing about it reaches the caller.
 bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
     descriptor file{fd};
-    if (info_traced())
-        trace_data(121, text(c.caclpath));
-    perf_timer timer(perf_at(1));
+    if (wanted<KX_ACL_TP_READ_OPEN>())
+        trace<KX_ACL_TP_READ_OPEN>(text(c.caclpath));
+    perf_timer timer(wanted<KX_ACL_TP_READ_LOADED>());
     acl__lock_acl_file(c.caclpath, fd, 1);
     char *bytes = nullptr;
     std::size_t size = 0;
@@ -214,7 +211,7 @@ bool take_cacl(read_call &c, int fd, const struct stat &cacl_st) {
         read_known_size(c.caclpath, fd, static_cast<std::uint64_t>(cacl_st.st_size), &bytes, &size);
     unique_mem<char> owned(bytes);
     if (timer.wanted())
-        trace_perf(2, c.caclpath, timer);
+        trace_perf<KX_ACL_TP_READ_LOADED>(c.caclpath, timer);
     if (rc != SEC_S_OK || size == 0 || size > layout::max_buffer_length) {
         cu_set_no_error_1();
         return false;
@@ -242,7 +239,8 @@ struct tree_array {
 
 void trace_line(int lineno, const sec_acle_desc &entry) {
     auto type = static_cast<kx_int32_t>(entry.type);
-    trace_data(114, num(lineno), num(type), text(entry.mech), text(entry.id), num(entry.perm));
+    trace<KX_ACL_TP_PARSE_LINE>(num(lineno), num(type), text(entry.mech), text(entry.id),
+                                num(entry.perm));
 }
 
 // Opens the text ACL file, once: every decision about the text comes from
@@ -256,13 +254,13 @@ kx_int32_t open_text(read_call &c, descriptor *file, struct stat *st) {
             if (rc != SEC_S_OK)
                 return rc;
         }
-        if (info_traced())
-            trace_data(121, text(c.aclpath));
+        if (wanted<KX_ACL_TP_READ_OPEN>())
+            trace<KX_ACL_TP_READ_OPEN>(text(c.aclpath));
         file->reset(open_timed(c.aclpath, 0));
         if (file->fd < 0) {
             int err = errno;
-            if (info_traced())
-                trace_data(122, text(c.aclpath), num(err));
+            if (wanted<KX_ACL_TP_READ_OPEN_FAILED>())
+                trace<KX_ACL_TP_READ_OPEN_FAILED>(text(c.aclpath), num(err));
             return report<MSG_2650_137>(SEC_S_FILE_ERROR, c.aclpath, err);
         }
         if (sys_fstat(file->fd, st) != 0)
@@ -295,7 +293,7 @@ kx_int32_t check_opened_text(const read_call &c, int fd, const struct stat &st) 
 // ends in a final one.
 kx_int32_t compile_run(read_call &c, const text_run &run, const space_bytes &spaces,
                        tree_array &trees) {
-    bool lines_traced = trace_level(TRC_INFO) > 7;
+    bool lines_traced = wanted<KX_ACL_TP_PARSE_LINE>();
     char *cursor = run.start;
     std::size_t remaining = run.length;
     for (;;) {
@@ -328,7 +326,7 @@ kx_int32_t compile_text(read_call &c, int fd, std::uint64_t size, const perf_tim
         if (rc != SEC_S_OK)
             return rc;
         if (run.final && timer.wanted())
-            trace_perf(2, c.aclpath, timer);
+            trace_perf<KX_ACL_TP_READ_LOADED>(c.aclpath, timer);
         rc = compile_run(c, run, spaces, trees);
         if (rc != SEC_S_OK)
             return rc;
@@ -350,13 +348,14 @@ kx_int32_t compile_and_cache(read_call &c) {
         return rc;
     c.acl_st = st;
     c.flags &= ~kx_uint32_t{SEC_F_ACL_CONVERT};
-    perf_timer timer(perf_at(1));
+    // Measures both the read (loaded) and the whole compile, at one level.
+    perf_timer timer(wanted<KX_ACL_TP_READ_COMPILED>());
     acl__lock_acl_file(c.aclpath, file.fd, 1);
     rc = compile_text(c, file.fd, static_cast<std::uint64_t>(st.st_size), timer);
     if (timer.wanted()) {
         perf_elapsed e = timer.elapsed();
-        trace_data(3, text(c.aclpath), num(c.lineno), num(e.ticks), num(e.seconds),
-                   num(e.nanoseconds));
+        trace<KX_ACL_TP_READ_COMPILED>(text(c.aclpath), num(c.lineno), num(e.ticks), num(e.seconds),
+                                       num(e.nanoseconds));
     }
     if (rc != SEC_S_OK) {
         clear_acl(c.acl);
@@ -379,8 +378,8 @@ kx_int32_t read_acl_file(read_call &c) {
     if (rc != SEC_S_OK)
         return rc;
     if (c.acl_st.st_size == 0) {
-        if (info_traced())
-            trace_data(116, text(c.aclpath));
+        if (wanted<KX_ACL_TP_READ_EMPTY>())
+            trace<KX_ACL_TP_READ_EMPTY>(text(c.aclpath));
         return SEC_S_OK;
     }
     if (c.username && !owner_rule_holds(c, c.acl_st))
@@ -405,15 +404,14 @@ using namespace kxacl;
 extern "C" ACL_EXTERN kx_int32_t sec_read_acl_file(const char *filename, const char *username,
                                                    sec_perm_set_t permtmpl, kx_uint32_t flags,
                                                    sec_buffer_t acl, kx_uint32_t *rflags) noexcept {
-    constexpr api_points points = api_read_acl_file;
-    api_enter(points, clears_record::yes, [&] {
-        trace_data(points.entry_data, text(filename), text(username), num(permtmpl), num(flags),
-                   num(acl));
+    using points = api_read_acl_file;
+    api_enter<points>(clears_record::yes, [&] {
+        trace<points::entry_data>(text(filename), text(username), num(permtmpl), num(flags),
+                                  num(acl));
     });
     read_call c{filename, username, permtmpl, flags, acl};
     kx_int32_t status = read_acl_file(c);
     if (rflags)
         *rflags = c.flags;
-    return api_leave(points, status,
-                     [&] { trace_data(points.exit_ok, num(status), num(c.lineno)); });
+    return api_leave<points>(status, [&] { trace<points::exit_ok>(num(status), num(c.lineno)); });
 }

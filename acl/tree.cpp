@@ -226,9 +226,10 @@ kx_int32_t merge_duplicate(sec_boolean_t single, const sec_acle_t acle, node *ex
         return report_duplicate(acle);
     sec_acle_t stored = existing->sat_acle;
     stored->perm = acle->perm;
-    if (trace_level(TRC_INFO) != 0)
-        trace_data(113, text(type_word(stored->type)),
-                   text(type_has_mech(stored->type) ? stored->mech : "<none>"), text(stored->id));
+    if (wanted<KX_ACL_TP_TREE_DUPLICATE>())
+        trace<KX_ACL_TP_TREE_DUPLICATE>(text(type_word(stored->type)),
+                                        text(type_has_mech(stored->type) ? stored->mech : "<none>"),
+                                        text(stored->id));
     return SEC_S_OK;
 }
 

@@ -160,7 +160,8 @@ ACL_EXTERN kx_int32_t sec_translate_bitmask(kx_uint32_t bitmask, sec_perm_set_t 
 ACL_EXTERN kx_int32_t sec_create_acle(unsigned char type, kx_uint32_t perm, const char *mech,
                                       const char *id, sec_acle_t *acle) KX_NOTHROW;
 
-/** Releases an entry and its identity. NULL is ignored. Keeps the error record. */
+/** Releases an entry and its identity. NULL is ignored. Keeps the error record.
+ *  Returns nothing. */
 ACL_EXTERN void sec_release_acle(sec_acle_t acle) KX_NOTHROW;
 
 /**
@@ -217,33 +218,49 @@ ACL_EXTERN kx_int32_t sec_release_acl(sec_acl_buffer_t acl) KX_NOTHROW;
  * Lists every entry of acl into aclelist (overwritten, not released): sub-ACL
  * by sub-ACL in buffer order; user and group entries in ascending identity
  * order, expanded entries in stored order. Identities are copied as stored.
- * @return SEC_S_OK, SEC_S_BAD_PARAM, SEC_S_BAD_ACL, SEC_S_NO_MEMORY; after a
- *         failure past the checks the list is empty.
+ * @return SEC_S_OK; SEC_S_BAD_PARAM (2650-101); SEC_S_BAD_ACL (2650-109,
+ *         2650-115, and 2650-110, 2650-111, 2650-123 for a corrupt buffer);
+ *         SEC_S_NO_MEMORY. After a failure past the checks the list is empty.
  */
 ACL_EXTERN kx_int32_t sec_list_acl(sec_acl_buffer_t acl, sec_acle_list_t aclelist) KX_NOTHROW;
 
 /**
  * Lists the entries of one type; for user and expanded entries of mechanism
  * mech (case-insensitive), or of every mechanism when mech is NULL.
+ * @return as sec_list_acl, and SEC_S_BAD_PARAM (2650-101) for an unknown
+ *         type (position 2) or an empty or too long mech (position 3).
  */
 ACL_EXTERN kx_int32_t sec_list_acl_by_type(sec_acl_buffer_t acl, unsigned char type, char *mech,
                                            sec_acle_list_t aclelist) KX_NOTHROW;
 
-/** Releases every entry of the list and empties it. Keeps the error record. */
+/** Releases every entry of the list and empties it; NULL is ignored. Keeps the
+ *  error record. Returns nothing. */
 ACL_EXTERN void sec_release_aclelist(sec_acle_list_t aclelist) KX_NOTHROW;
 
 /**
  * Adds acle to acl; an entry of the same identity takes acle's mask. The
  * empty ACL is accepted. acl->value may move. On failure acl is unchanged.
+ * @return SEC_S_OK; SEC_S_BAD_PARAM (2650-101); SEC_S_BAD_ACLE (2650-116
+ *         unknown type, 2650-117 missing mechanism or identity);
+ *         SEC_S_BAD_ACL (2650-113, 2650-114, 2650-115, 2650-110 and other
+ *         messages of a corrupt buffer); SEC_S_NO_MEMORY; SEC_S_INTERNAL_ERROR.
  */
 ACL_EXTERN kx_int32_t sec_add_acle_to_acl(sec_acle_t acle, sec_acl_buffer_t acl) KX_NOTHROW;
 
-/** As sec_add_acle_to_acl, but an entry of the same identity is a failure. */
+/**
+ * As sec_add_acle_to_acl, but an entry of the same identity is a failure.
+ * @return as sec_add_acle_to_acl, and SEC_S_BAD_ACLE (2650-157, 2650-174,
+ *         2650-175) for an entry of the same identity.
+ */
 ACL_EXTERN kx_int32_t sec_add_acle_to_acl2(sec_acle_t acle, sec_acl_buffer_t acl) KX_NOTHROW;
 
 /**
  * Deletes the entry of acle's identity (the mask is not compared); an emptied
  * sub-ACL is removed. acl->value may move.
+ * @return SEC_S_OK; SEC_S_ACLE_NOT_FOUND (2650-118) when no entry has that
+ *         identity; SEC_S_BAD_PARAM (2650-101); SEC_S_BAD_ACLE (2650-116,
+ *         2650-117); SEC_S_BAD_ACL (2650-106 for the empty ACL, 2650-113,
+ *         2650-114, 2650-115, corrupt buffers); SEC_S_NO_MEMORY.
  */
 ACL_EXTERN kx_int32_t sec_del_acle_from_acl(sec_acle_t acle, sec_acl_buffer_t acl) KX_NOTHROW;
 
@@ -260,7 +277,20 @@ ACL_EXTERN kx_int32_t sec_del_acle_from_acl(sec_acle_t acle, sec_acl_buffer_t ac
  * @param flags     SEC_F_ACL_TEXT, SEC_F_ACL_CACHE, SEC_F_ACL_CONVERT
  * @param[out] acl  the ACL buffer (release with sec_release_acl); the empty
  *                  ACL when the file holds no entry or on failure
- * @param[out] rflags NULL, or the flags as the call ended
+ * @param[out] rflags NULL, or the flags as the call ended: SEC_F_ACL_TEXT when
+ *                  the text was compiled, SEC_F_ACL_CACHE only when the cached
+ *                  file was written, SEC_F_ACL_CONVERT only when cached bytes
+ *                  were validated; flags unchanged for an empty file
+ * @return SEC_S_OK; SEC_S_BAD_PARAM (2650-101, 2650-134, 2650-165);
+ *         SEC_S_USER_NOT_FOUND (2650-140); SEC_S_NO_ACL_FILE (2650-135,
+ *         2650-166, 2650-167) for a name that leads to no regular file;
+ *         SEC_S_BAD_PERMISSION (2650-141 owner or mode, 2650-180 permission
+ *         of a line); SEC_S_FILE_ERROR (2650-135, 2650-137, 2650-139,
+ *         2650-158); SEC_S_BAD_ACL (2650-144, 2650-145, 2650-172, 2650-173,
+ *         2650-179) for a line that cannot be parsed; SEC_S_BAD_ACLE
+ *         (2650-157, 2650-174, 2650-175) for duplicate entries;
+ *         SEC_S_NO_MEMORY. A cached file that cannot be used or written is
+ *         never a failure.
  */
 ACL_EXTERN kx_int32_t sec_read_acl_file(const char *filename, const char *username,
                                         sec_perm_set_t permtmpl, kx_uint32_t flags,
@@ -273,7 +303,11 @@ ACL_EXTERN kx_int32_t sec_read_acl_file(const char *filename, const char *userna
 /**
  * Registers an identity handler of type SEC_ID_HANDLER_EXPANDED or
  * SEC_ID_HANDLER_USER for a mechanism (1 to 16 bytes). The first handler
- * registered for a type and mechanism (case-insensitive) is the one used.
+ * registered for a type and mechanism (case-insensitive) is the one used;
+ * a later one returns SEC_S_OK and is never used.
+ * @return SEC_S_OK; SEC_S_BAD_PARAM (2650-101 with routine name
+ *         "acl__register_id_handler", 2650-132 for an empty or too long
+ *         mech); SEC_S_NO_MEMORY; SEC_S_INTERNAL_ERROR (2650-131).
  */
 ACL_EXTERN kx_int32_t sec__register_id_handler(kx_uint32_t type, const char *mech,
                                                sec_acl_id_handler handler) KX_NOTHROW;
@@ -283,11 +317,24 @@ ACL_EXTERN kx_int32_t sec__register_id_handler(kx_uint32_t type, const char *mec
  * expanded requester. type is an entry type, for user requests optionally
  * with SEC_ACLE_HANDLER_BIT; zmech, when not NULL, selects the sub-ACL in
  * place of mech. Allocates nothing on success with tracing off.
+ * @return SEC_S_OK with the entry's mask in *perm (possibly 0);
+ *         SEC_S_BAD_ACLE (2650-147) when no entry answers: no sub-ACL of the
+ *         type, no matching entry, or no expanded handler registered;
+ *         SEC_S_BAD_PARAM (2650-101, 2650-128, 2650-129, 2650-130);
+ *         SEC_S_BAD_ACL (2650-109, also for the empty ACL; 2650-115, 2650-110,
+ *         2650-122); SEC_S_INTERNAL_ERROR (2650-131).
  */
 ACL_EXTERN kx_int32_t sec__single_acle_perm(sec_acl_buffer_t acl, unsigned char type, char *mech,
                                             char *zmech, char *id, kx_uint32_t *perm) KX_NOTHROW;
 
-/** The OR of the masks that acl's group entries grant to count group names. */
+/**
+ * The OR of the masks that acl's group entries grant to count group names
+ * (groups[i].value, NUL-terminated; NULL names are skipped).
+ * @return SEC_S_OK, also for count 0 (mask 0); SEC_S_BAD_ACLE (2650-147)
+ *         when no group of a non-empty list has an entry; SEC_S_BAD_PARAM
+ *         (2650-101); SEC_S_BAD_ACL (2650-109, also for the empty ACL;
+ *         2650-115, 2650-110).
+ */
 ACL_EXTERN kx_int32_t sec__group_acles_perm(sec_acl_buffer_t acl, kx_int32_t count,
                                             sec_buffer_t groups, kx_uint32_t *perm) KX_NOTHROW;
 
@@ -297,7 +344,7 @@ ACL_EXTERN kx_int32_t sec__group_acles_perm(sec_acl_buffer_t acl, kx_int32_t cou
 
 /**
  * Prints acl in readable form on standard error, one catalogue message per
- * line. Clears the thread's error record after every line.
+ * line. Clears the thread's error record after every line. Returns nothing.
  */
 ACL_EXTERN void sec__dump_acl(sec_acl_buffer_t acl) KX_NOTHROW;
 

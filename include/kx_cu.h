@@ -117,6 +117,7 @@ CU_EXTERN void cu_set_no_error_1(void);
 /**
  * Makes a copy of err the calling thread's record; err NULL, or a record with
  * cu_error_id 0, clears it. Same memory rule as cu_set_error_1.
+ * @return 0, or CU_ERROR_ID_NO_MEMORY as cu_set_error_1.
  */
 CU_EXTERN int cu_pset_error_1(const cu_error_t *err);
 

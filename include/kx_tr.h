@@ -5,10 +5,15 @@
  *
  * Configuration, read when a component registers:
  * - KX_TRACE_LEVELS: levels per component and category, for example
- *   "_SEL:API=8,Perf=2;_XYZ:*=1". Components are separated by ';',
- *   categories by ','; a category is named by its name (case-insensitive) or
- *   "*" for all of them; levels are 0 to 9. Unknown names and malformed parts
- *   are ignored. Categories not named keep their default level.
+ *   "_SEL:API=8,Perf=2;_XYZ:all=1". Components are separated by ';',
+ *   categories by ','; a component is named exactly, a category by its name
+ *   in any case, or "all" (or "*") for all of them; levels are 0 to 9 (more
+ *   counts as 9). Later settings override earlier ones; categories not named
+ *   keep their default level. A part that cannot be read (no component, no
+ *   "=", a level that is not a number, a category the component does not
+ *   have) is ignored with a warning on standard error that names it, at most
+ *   a few per process; settings of components never registered are not
+ *   checked for category names.
  * - KX_TRACE_FILE: the file that records are appended to. Without it records
  *   are dropped (the levels still apply, so callers still see them).
  *
@@ -60,7 +65,10 @@ TR_EXTERN int tr_register_component_1(const char *component, tr_detail_level_t *
                                       const tr_category_description_t *categories,
                                       kx_uint32_t count) KX_NOTHROW;
 
-/** Forgets a component; its levels array is no longer written. */
+/**
+ * Forgets a component; its levels array is no longer written.
+ * @return TR_OK, TR_BAD_ARGUMENT or TR_NOT_REGISTERED.
+ */
 TR_EXTERN int tr_unregister_component_1(const char *component) KX_NOTHROW;
 
 /**
@@ -72,13 +80,18 @@ TR_EXTERN int tr_unregister_component_1(const char *component) KX_NOTHROW;
 TR_EXTERN int tr_set_detail_level_1(const char *component, const char *category,
                                     tr_detail_level_t level) KX_NOTHROW;
 
-/** Records a trace point without data. */
+/**
+ * Records a trace point without data.
+ * @return TR_OK (also when KX_TRACE_FILE is not set), TR_BAD_ARGUMENT or
+ *         TR_WRITE_FAILED.
+ */
 TR_EXTERN int tr_record_id_1(const char *component, kx_uint32_t id) KX_NOTHROW;
 
 /**
  * Records a trace point with count data items. The variadic arguments are
  * count pairs: a pointer (const void *) and a byte length (kx_uint32_t).
  * A NULL pointer records as an item of no bytes.
+ * @return as tr_record_id_1; TR_BAD_ARGUMENT also for more than 64 items.
  */
 TR_EXTERN int tr_record_data_1(const char *component, kx_uint32_t id, kx_uint32_t count,
                                ...) KX_NOTHROW;

@@ -4,7 +4,7 @@
 set -euo pipefail
 packages=(build-essential cmake g++ clang libclang-rt-14-dev libgtest-dev libgmock-dev
           libbenchmark-dev locales valgrind cppcheck clang-tidy clang-format gettext-base
-          nlohmann-json3-dev pkgconf libc-dev-bin python3)
+          nlohmann-json3-dev pkgconf libc-dev-bin python3 mandoc)
 missing=()
 for p in "${packages[@]}"; do
   dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'install ok installed' || missing+=("$p")

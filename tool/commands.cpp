@@ -23,6 +23,7 @@
 #include "json.h"
 #include "templates.h"
 #include "text_lines.h"
+#include "trace_command.h"
 
 namespace kxtool {
 namespace {
@@ -302,6 +303,8 @@ int run_command(const invocation &inv) {
         return run_diff(inv);
     case command::install:
         return run_install(inv);
+    case command::trace:
+        return run_trace(inv);
     case command::none:
         break;
     }

@@ -11,10 +11,10 @@ namespace {
 constexpr unsigned bit(command c) {
     return 1u << static_cast<unsigned>(c);
 }
-constexpr unsigned every_command = bit(command::compile) | bit(command::check) |
-                                   bit(command::explain) | bit(command::list) | bit(command::lint) |
-                                   bit(command::diff) | bit(command::add) | bit(command::del) |
-                                   bit(command::dump) | bit(command::perms) | bit(command::install);
+constexpr unsigned every_command =
+    bit(command::compile) | bit(command::check) | bit(command::explain) | bit(command::list) |
+    bit(command::lint) | bit(command::diff) | bit(command::add) | bit(command::del) |
+    bit(command::dump) | bit(command::perms) | bit(command::install) | bit(command::trace);
 // The commands that read ACL text files, which may have to belong to a user.
 constexpr unsigned readers = bit(command::compile) | bit(command::check) | bit(command::explain) |
                              bit(command::list) | bit(command::lint) | bit(command::diff) |
@@ -28,7 +28,7 @@ struct command_entry {
     const char *name;
     command cmd;
 };
-constexpr std::array<command_entry, 11> commands = {{{"compile", command::compile},
+constexpr std::array<command_entry, 12> commands = {{{"compile", command::compile},
                                                      {"check", command::check},
                                                      {"explain", command::explain},
                                                      {"list", command::list},
@@ -38,7 +38,8 @@ constexpr std::array<command_entry, 11> commands = {{{"compile", command::compil
                                                      {"del", command::del},
                                                      {"dump", command::dump},
                                                      {"perms", command::perms},
-                                                     {"install", command::install}}};
+                                                     {"install", command::install},
+                                                     {"trace", command::trace}}};
 
 // The state of one parse: the arguments still to read and the result.
 struct parser {
@@ -127,6 +128,14 @@ void take_string(parser &p, std::string_view opt, const std::optional<std::strin
     p.take_value(opt, v, field);
 }
 
+// An option that may be given more than once.
+void take_more(parser &p, std::string_view opt, const std::optional<std::string_view> &v,
+               std::vector<std::string> &values) {
+    if (p.take_value(opt, v, values.emplace_back()))
+        return;
+    values.pop_back();
+}
+
 constexpr std::array option_table =
     {
         option_entry{"--help", every_command, true, arity::flag,
@@ -202,6 +211,19 @@ constexpr std::array option_table =
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::string; }},
         option_entry{"--mask", bit(command::perms), false, arity::flag,
                      [](parser &p, auto, auto &) { p.out.inv.perms_as = perms_mode::mask; }},
+        option_entry{"--follow", bit(command::trace), false, arity::flag,
+                     [](parser &p, auto, auto &) { p.out.inv.trace.follow = true; }},
+        option_entry{"--pid", bit(command::trace), false, arity::value,
+                     [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.pids); }},
+        option_entry{
+            "--thread", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.threads); }},
+        option_entry{
+            "--category", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.categories); }},
+        option_entry{
+            "--point", bit(command::trace), false, arity::value,
+            [](parser &p, auto o, auto &v) { take_more(p, o, v, p.out.inv.trace.points); }},
 };
 
 void handle_option(parser &p, std::string_view arg) {
@@ -248,6 +270,10 @@ void finish(parser &p) {
         return;
     if (inv.cmd == command::none)
         return p.fail("no command given");
+    if (inv.cmd == command::trace) {
+        inv.trace.files = std::move(p.positionals);
+        return;
+    }
     // diff and install take two files, perms one value or none, every other
     // command one file.
     const bool two_files = inv.cmd == command::diff || inv.cmd == command::install;

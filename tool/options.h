@@ -23,7 +23,8 @@ enum class command {
     del,
     dump,
     perms,
-    install
+    install,
+    trace
 };
 
 // How an input file is taken: by its first byte, or as the user says.
@@ -38,6 +39,14 @@ struct identity {
     char type = 0;
     std::string mech;
     std::vector<std::string> ids;
+};
+
+// trace: the files to decode and the records to show. Each filter may be
+// given more than once, each time with a comma-separated list.
+struct trace_request {
+    std::vector<std::string> files; // none, or "-": standard input
+    bool follow = false;
+    std::vector<std::string> pids, threads, categories, points;
 };
 
 struct invocation {
@@ -69,6 +78,8 @@ struct invocation {
 
     std::string perms_arg; // perms: a permission string or a mask
     perms_mode perms_as = perms_mode::detect;
+
+    trace_request trace;
 };
 
 // The parse result: the invocation, or the reason it is not one.

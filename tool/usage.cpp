@@ -18,6 +18,7 @@ const char *usage_summary() {
            "  del BUFFER WHO     delete an entry from a buffer file\n"
            "  dump FILE          print an ACL in full detail\n"
            "  perms [PERMS]      translate a permission string or mask; list the templates\n"
+           "  trace [FILE...]    decode the library's trace file (KX_TRACE_FILE)\n"
            "\n"
            "WHO is one of --unauthenticated, --anyother, --user MECH ID, --expanded MECH ID,\n"
            "--group NAME... (check takes several group names; explain takes several of\n"
@@ -158,6 +159,25 @@ const char *command_help(command cmd) {
                "CHAR is one printable character (not '#'), BIT a bit number 0 to 31, NAME\n"
                "one word of at most 13 bytes and HELP the rest of the line (at most 63\n"
                "bytes). Blank lines and lines starting with '#' are ignored.\n";
+    case command::trace:
+        return "Usage: kxacl trace [FILE...] [--follow] [--pid PID] [--thread TID]\n"
+               "                   [--category NAME] [--point POINT] [--templates FILE] [--json]\n"
+               "\n"
+               "Decodes the records that the library wrote to its trace file (see\n"
+               "KX_TRACE_FILE and KX_TRACE_LEVELS in kxacl(1)): one line per record with\n"
+               "its local time, thread, category, point and every item by name. FILE is\n"
+               "read whole, standard input without FILE or for '-'. A line that is not a\n"
+               "record of the library is shown raw, after \"raw: \".\n"
+               "  --follow          keep reading FILE as it grows\n"
+               "  --pid PID         only the threads of process PID\n"
+               "  --thread TID      only thread TID\n"
+               "  --category NAME   only category NAME: Errors, Info, API, Buffer, Perf\n"
+               "  --point POINT     only POINT: an id, a name such as sec_read_acl_file:exit,\n"
+               "                    or a function or step such as read\n"
+               "  --templates FILE  show permission masks with the letters of FILE\n"
+               "  --json            one JSON object per record (JSON Lines)\n"
+               "Filters take comma-separated lists and may be repeated.\n"
+               "Exit status: 0 every line decoded, 1 some shown raw, 2 failure.\n";
     case command::none:
         break;
     }

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
 #include <cerrno>
 #include <charconv>
 #include <cstdarg>
@@ -91,15 +92,19 @@ struct component {
     std::vector<category> categories;
 };
 
+bool selects_all(std::string_view selector) {
+    return selector == "*" || equal_ignoring_case(selector, "all");
+}
+
 // Calls apply for each category that selector names: its name, ignoring
-// case, or "*" for all. Returns whether any was named.
+// case, or "*" or "all" for all. Returns whether any was named.
 template <typename Apply>
 bool for_each_selected(const component &c, std::string_view selector, Apply &&apply) {
     if (selector.empty())
         return false;
     bool any = false;
     for (const category &cat : c.categories) {
-        if (selector == "*" || equal_ignoring_case(selector, cat.name)) {
+        if (selects_all(selector) || equal_ignoring_case(selector, cat.name)) {
             apply(cat);
             any = true;
         }
@@ -149,7 +154,33 @@ component describe_component(const char *name, tr_detail_level_t *levels,
 }
 
 // ---------------------------------------------------------------------------
-// KX_TRACE_LEVELS, e.g. "_SEL:API=8,Perf=2;_XYZ:*=1"
+// KX_TRACE_LEVELS, e.g. "_SEL:API=8,Perf=2;_XYZ:all=1"
+
+// Warnings about the configuration go to standard error, a few at most, so
+// that a long mistaken setting cannot flood a daemon's log.
+constexpr int max_warnings = 8;
+std::atomic<int> warnings_given{0};
+
+// A warning that cannot be made or written is given up: it must never fail
+// the registration it comes from.
+void warn(const std::string &what) noexcept {
+    const int given = warnings_given.fetch_add(1);
+    if (given > max_warnings)
+        return;
+    try {
+        const std::string line = given == max_warnings
+                                     ? "kx_tr: KX_TRACE_LEVELS: further mistakes not shown\n"
+                                     : "kx_tr: KX_TRACE_LEVELS: " + what + "\n";
+        // One write, so that the line stays whole beside other output.
+        if (write(STDERR_FILENO, line.data(), line.size()) < 0)
+            return;
+    } catch (...) {
+    }
+}
+
+std::string quoted(std::string_view text) {
+    return "\"" + std::string(text) + "\"";
+}
 
 // Calls visit for each field of text separated by separator, empty ones too.
 template <typename Visit>
@@ -177,17 +208,59 @@ std::optional<kx_uint32_t> parse_level(std::string_view text) {
     return level;
 }
 
-// Applies one "category=level" setting; a malformed one changes nothing.
-template <typename Apply>
-void apply_setting(const component &c, std::string_view setting, Apply &&apply) {
+// What is wrong with one "category=level" setting, or "" when nothing is.
+std::string setting_mistake(std::string_view setting) {
     const auto equals = setting.find('=');
     if (equals == std::string_view::npos)
+        return quoted(setting) + " has no \"=LEVEL\"";
+    if (trim_blanks(setting.substr(0, equals)).empty())
+        return quoted(setting) + " names no category";
+    if (!parse_level(setting.substr(equals + 1)))
+        return "the level of " + quoted(setting) + " is not a number from 0 to 9";
+    return {};
+}
+
+// Warns once per process about each part of the configuration that cannot
+// be read, whichever component it names; the parts are then ignored.
+void check_configuration(std::string_view configured) {
+    static std::atomic<bool> checked{false};
+    if (checked.exchange(true))
         return;
+    for_each_field(configured, ';', [&](std::string_view entry) {
+        if (trim_blanks(entry).empty())
+            return;
+        const auto colon = entry.find(':');
+        if (colon == std::string_view::npos || trim_blanks(entry.substr(0, colon)).empty())
+            return warn(quoted(trim_blanks(entry)) +
+                        " names no component (write COMPONENT:CATEGORY=LEVEL,...)");
+        for_each_field(entry.substr(colon + 1), ',', [&](std::string_view setting) {
+            if (trim_blanks(setting).empty())
+                return;
+            if (auto mistake = setting_mistake(trim_blanks(setting)); !mistake.empty())
+                warn(mistake);
+        });
+    });
+}
+
+std::string category_list(const component &c) {
+    std::string names;
+    for (const category &cat : c.categories)
+        names += (names.empty() ? "" : ", ") + cat.name;
+    return names;
+}
+
+// Applies one "category=level" setting; a malformed one changes nothing,
+// and a category that c does not have is warned about.
+template <typename Apply>
+void apply_setting(const component &c, std::string_view setting, Apply &&apply) {
+    if (!setting_mistake(setting).empty())
+        return;
+    const auto equals = setting.find('=');
     const auto level = parse_level(setting.substr(equals + 1));
-    if (!level)
-        return;
-    for_each_selected(c, trim_blanks(setting.substr(0, equals)),
-                      [&](const category &cat) { apply(cat, *level); });
+    const auto name = trim_blanks(setting.substr(0, equals));
+    if (!for_each_selected(c, name, [&](const category &cat) { apply(cat, *level); }))
+        warn("no category " + quoted(name) + " in " + c.name + " (" + category_list(c) +
+             ", or all)");
 }
 
 // Calls apply(category, level) for each setting of component c, in order.
@@ -195,6 +268,7 @@ template <typename Apply> void for_each_configured_level(const component &c, App
     const char *configured = std::getenv("KX_TRACE_LEVELS");
     if (!configured)
         return;
+    check_configuration(configured);
     for_each_field(configured, ';', [&](std::string_view entry) {
         const auto colon = entry.find(':');
         if (colon == std::string_view::npos || trim_blanks(entry.substr(0, colon)) != c.name)

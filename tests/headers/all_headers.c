@@ -4,6 +4,7 @@
 #include <kx_cu.h>
 #include <kx_tr.h>
 #include <kx_acl.h>
+#include <kx_acl_trace.h>
 
 /* The record layouts C callers rely on. */
 typedef char check_acle_mech[sizeof(((sec_acle_desc *)0)->mech) == 17 ? 1 : -1];

@@ -61,6 +61,7 @@ INSTANTIATE_TEST_SUITE_P(
         configured_case{"_SEL:API=8;_TST:Perf=7;_XYZ:*=1", {0, 1, 7, 9, 4}},
         configured_case{"_TST:*=1,API=8", {1, 8, 2, 1, 4}},
         configured_case{"_TST:API=8,*=1", {1, 1, 2, 1, 4}}, configured_case{"_TST:*=0", minimums},
+        configured_case{"_TST:ALL=3,api=8", {3, 8, 3, 3, 4}},
         configured_case{"_TST:*=7", {7, 7, 7, 7, 7}},
         configured_case{"_TST:API=8;;_TST:,Errors=2,", {2, 8, 3, 9, 4}},
         configured_case{" _TST : API = 8 ", {0, 8, 3, 9, 4}},
@@ -123,6 +124,29 @@ TEST_F(Levels, SetChangesNamedCategoriesOfItsComponentOnly) {
     EXPECT_EQ(other, minimums);
     EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
     EXPECT_EQ(tr_unregister_component_1("_TWO"), TR_OK);
+}
+
+// Each part that cannot be read is named once on standard error: syntax
+// once per process, a category the component lacks at its registration; a
+// few warnings at most.
+TEST_F(Levels, UnreadablePartsAreWarnedAboutByName) {
+    setenv("KX_TRACE_LEVELS", "_TST:API=8x,Nope=1,all=2;API=8;_TST:Perf", 1);
+    ::testing::internal::CaptureStderr();
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    EXPECT_EQ(levels, (levels_t{2, 2, 2, 2, 4})) << "only all=2 is read";
+    ASSERT_EQ(tr_unregister_component_1("_TST"), TR_OK);
+    setenv("KX_TRACE_LEVELS", "_TST:a=1,b=1,c=1,d=1,e=1,f=1", 1);
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    const std::string prefix = "kx_tr: KX_TRACE_LEVELS: ";
+    const std::string all = " (Perf, Errors, Info, API, Buffer, or all)\n";
+    EXPECT_EQ(::testing::internal::GetCapturedStderr(),
+              prefix + "the level of \"API=8x\" is not a number from 0 to 9\n" + prefix +
+                  "\"API=8\" names no component (write COMPONENT:CATEGORY=LEVEL,...)\n" + prefix +
+                  "\"Perf\" has no \"=LEVEL\"\n" + prefix + "no category \"Nope\" in _TST" + all +
+                  prefix + "no category \"a\" in _TST" + all + prefix +
+                  "no category \"b\" in _TST" + all + prefix + "no category \"c\" in _TST" + all +
+                  prefix + "no category \"d\" in _TST" + all + prefix +
+                  "further mistakes not shown\n");
 }
 
 // The registry keeps its own copies of the names.
