@@ -23,6 +23,10 @@ find_program(KX_PKG_CONFIG NAMES pkg-config pkgconf)
 if(NOT KX_PKG_CONFIG)
   list(APPEND kx_test_missing "pkg-config (Debian package pkgconf)")
 endif()
+# localedef builds the tests' Latin-1 locales from the C library's sources.
+if(NOT EXISTS /usr/share/i18n/locales/en_US OR NOT EXISTS /usr/share/i18n/charmaps/ISO-8859-1.gz)
+  list(APPEND kx_test_missing "the locale sources (Debian package locales)")
+endif()
 list(JOIN kx_test_missing ", " kx_test_missing_text)
 
 if(DEFINED BUILD_TESTING)

@@ -8,8 +8,8 @@
 #                                      benchmarks, fuzzing and static analysis need
 set -euo pipefail
 run=(build-essential cmake)
-package=("${run[@]}" debhelper dpkg-dev lintian libgtest-dev nlohmann-json3-dev pkgconf)
-test=("${package[@]}" clang libclang-rt-14-dev libgmock-dev libbenchmark-dev locales valgrind
+package=("${run[@]}" debhelper dpkg-dev lintian libgtest-dev locales nlohmann-json3-dev pkgconf)
+test=("${package[@]}" clang libclang-rt-14-dev libgmock-dev libbenchmark-dev valgrind
       cppcheck clang-tidy clang-format gettext-base python3)
 case "${1:-test}" in
   run) packages=("${run[@]}") ;;
