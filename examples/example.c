@@ -2,13 +2,20 @@
  * resource from its ACL file (through the cached compiled file when that is
  * current), then ask what it grants to each requester. Public interface only.
  *
- *   kxacl_example [ACL-FILE]      (default: resource.acl beside the program's sources)
+ *   kxacl_example [ACL-FILE]
+ *
+ * The default ACL file is resource.acl beside the program's sources when
+ * CMake builds it, in the current folder otherwise.
  */
 #include <stdio.h>
 #include <stdlib.h>
 
 #include <kx_acl.h>
 #include <kx_cu.h>
+
+#ifndef KXACL_EXAMPLE_ACL
+#define KXACL_EXAMPLE_ACL "resource.acl"
+#endif
 
 /* Prints the thread's error message after a failed call. */
 static void print_failure(const char *what, kx_int32_t status) {
@@ -25,8 +32,8 @@ static void print_failure(const char *what, kx_int32_t status) {
 static void authorize_user(sec_buffer_t acl, const char *mech, const char *id) {
     kx_uint32_t mask = 0;
     char perms[33] = "";
-    kx_int32_t rc = sec__single_acle_perm(acl, SEC_ACLE_USER, (char *)mech, NULL, (char *)id,
-                                          &mask);
+    kx_int32_t rc =
+        sec__single_acle_perm(acl, SEC_ACLE_USER, (char *)mech, NULL, (char *)id, &mask);
     if (rc == SEC_S_BAD_ACLE) {
         printf("%-40s no entry\n", id);
         return;

@@ -9,7 +9,7 @@ cd "$(dirname "$0")/.."
 scripts/install-deps.sh
 cmake -S . -B build-bench -DCMAKE_BUILD_TYPE=Release \
   -DCMAKE_CXX_FLAGS_RELEASE="-O2 -DNDEBUG" -DCMAKE_C_FLAGS_RELEASE="-O2 -DNDEBUG" \
-  -DKX_BUILD_TESTS=OFF -DKX_BUILD_BENCH=ON >/dev/null
+  -DBUILD_TESTING=OFF -DKX_BUILD_BENCH=ON >/dev/null
 cmake --build build-bench -j"$(nproc)" --target kxacl_bench
 out=build-bench/results
 mkdir -p "$out"

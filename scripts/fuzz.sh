@@ -21,7 +21,7 @@ usage() { sed -n '2,13p' "$0" | sed 's/^# \{0,1\}//'; exit 2; }
 
 build() {
   CC=clang CXX=clang++ cmake -S "$root" -B "$tree" -DCMAKE_BUILD_TYPE=RelWithDebInfo \
-    -DKX_FUZZ=ON -DKX_BUILD_TESTS=OFF >/dev/null
+    -DKX_FUZZ=ON -DBUILD_TESTING=OFF -DCMAKE_COMPILE_WARNING_AS_ERROR=ON >/dev/null
   cmake --build "$tree" -j"$(nproc)"
 }
 

@@ -15,7 +15,7 @@ for d in "${source_dirs[@]}"; do
 done
 
 CC=clang CXX=clang++ cmake -S . -B build-lint -DCMAKE_BUILD_TYPE=RelWithDebInfo \
-  -DKX_BUILD_TESTS=OFF -DCMAKE_EXPORT_COMPILE_COMMANDS=ON >/dev/null
+  -DBUILD_TESTING=OFF -DCMAKE_COMPILE_WARNING_AS_ERROR=ON -DCMAKE_EXPORT_COMPILE_COMMANDS=ON >/dev/null
 # Generated sources, if any, must exist before they are analysed.
 cmake --build build-lint -j"$(nproc)" >/dev/null
 

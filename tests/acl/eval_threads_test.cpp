@@ -106,7 +106,10 @@ TEST(EvaluationThreads, EvaluateWhileRegistering) {
     for (int t = 0; t < registrars; ++t)
         threads.emplace_back([&, t] {
             for (int i = 0; i < registrations; ++i) {
-                std::string mech = "m" + std::to_string(t) + "-" + std::to_string(i);
+                std::string mech = "m";
+                mech += std::to_string(t);
+                mech += '-';
+                mech += std::to_string(i);
                 kx_uint32_t type = i % 2 ? SEC_ID_HANDLER_USER : SEC_ID_HANDLER_EXPANDED;
                 // Other mechanisms, and the ones in use, which must stay unreached.
                 const char *same = i % 2 ? "UNIX" : "Krb5";

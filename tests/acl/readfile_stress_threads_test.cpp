@@ -122,7 +122,8 @@ TEST(ReadAclFileThreads, ReadersListersAndEvaluatorsWhileTheFileIsRewritten) {
     });
     threads.emplace_back([&] {
         for (int i = 0; i < 200; ++i) {
-            std::string mech = "m" + std::to_string(i);
+            std::string mech = "m";
+            mech += std::to_string(i);
             kx_uint32_t type = i % 2 ? SEC_ID_HANDLER_USER : SEC_ID_HANDLER_EXPANDED;
             if (sec__register_id_handler(type, mech.c_str(), same_user) != SEC_S_OK)
                 note("register " + mech);

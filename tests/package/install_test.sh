@@ -1,21 +1,32 @@
 #!/bin/sh
-# Installs a build tree into a fresh prefix, then builds a small C program
-# against that prefix twice, with pkg-config and with find_package, and runs
-# both. Arguments: cmake, pkg-config, build tree, work directory, C compiler,
-# library directory under the prefix.
+# Builds a small C program against an installed tree twice, with pkg-config
+# and with find_package, and runs both and the installed kxacl.
+#
+#   install_test.sh CMAKE PKG_CONFIG CC LIBDIR WORK BUILD RPATH
+#       installs the build tree BUILD into WORK/prefix first; RPATH is 1 when
+#       the installed programs carry their run path, 0 when they do not
+#   install_test.sh CMAKE PKG_CONFIG CC LIBDIR WORK --system
+#       uses the tree installed in /usr (the Debian packages), as programs
+#       of the system find it: with no search path set
 set -eu
-cmake=$1 pkg_config=$2 build=$3 work=$4 cc=$5 libdir=$6
+cmake=$1 pkg_config=$2 cc=$3 libdir=$4 work=$5 build=$6 rpath=${7:-0}
 consumer=$(cd "$(dirname "$0")/consumer" && pwd)
-prefix=$work/prefix
 
 rm -rf "$work"
 mkdir -p "$work"
-"$cmake" --install "$build" --prefix "$prefix" >/dev/null
-
-# The catalogue search path that the installation notes give for a prefix
-# of its own.
-NLSPATH="$prefix/share/locale/%L/LC_MESSAGES/%N"
-export NLSPATH
+if [ "$build" = --system ]; then
+    prefix=/usr
+    run_env=""
+else
+    prefix=$work/prefix
+    "$cmake" --install "$build" --prefix "$prefix" >/dev/null
+    PKG_CONFIG_PATH="$prefix/$libdir/pkgconfig" CMAKE_PREFIX_PATH="$prefix"
+    # The catalogue search path that the installation notes give for a
+    # prefix of its own.
+    NLSPATH="$prefix/share/locale/%L/LC_MESSAGES/%N"
+    export PKG_CONFIG_PATH CMAKE_PREFIX_PATH NLSPATH
+    run_env="LD_LIBRARY_PATH=$prefix/$libdir"
+fi
 
 expected="rwx 0xb
 rwz 36
@@ -29,22 +40,31 @@ check() {
     fi
 }
 
-flags=$(PKG_CONFIG_PATH="$prefix/$libdir/pkgconfig" "$pkg_config" --cflags --libs kxacl)
+flags=$("$pkg_config" --cflags --libs kxacl)
 # shellcheck disable=SC2086 # the flags are separate words
 "$cc" -std=c99 -Wall -Wextra -Werror -o "$work/with_pkg_config" "$consumer/consumer.c" $flags
-out=$(LD_LIBRARY_PATH="$prefix/$libdir" "$work/with_pkg_config")
+out=$(env $run_env "$work/with_pkg_config")
 check pkg-config "$out"
 
-"$cmake" -S "$consumer" -B "$work/with_find_package" -DCMAKE_PREFIX_PATH="$prefix" \
-    -DCMAKE_C_COMPILER="$cc" >/dev/null
+# From here on the installed libraries find each other, and the tool finds
+# them, through their own run paths, if they have them.
+[ "$rpath" = 1 ] && run_env=""
+
+"$cmake" -S "$consumer" -B "$work/with_find_package" -DCMAKE_C_COMPILER="$cc" >/dev/null
 "$cmake" --build "$work/with_find_package" >/dev/null
 # Its build-tree run path leads to the installed libraries.
-out=$("$work/with_find_package/consumer")
+out=$(env $run_env "$work/with_find_package/consumer")
 check find_package "$out"
-# The tool finds the installed libraries through its own run path.
-out=$("$prefix/bin/kxacl" perms rwx)
-if [ "$out" != "rwx 0x0000000b" ] || [ ! -f "$prefix/share/man/man1/kxacl.1" ]; then
+
+out=$(env $run_env "$prefix/bin/kxacl" perms rwx)
+if [ "$out" != "rwx 0x0000000b" ]; then
     printf 'The installed kxacl printed:\n%s\n' "$out"
+    exit 1
+fi
+# Debian packages hold their manual pages compressed.
+man=$prefix/share/man/man1/kxacl.1
+if [ ! -f "$man" ] && [ ! -f "$man.gz" ]; then
+    echo "kxacl's manual page is not installed"
     exit 1
 fi
 echo "pkg-config and find_package consumers and the installed tool passed"
