@@ -91,10 +91,17 @@ std::string human(const std::vector<change> &changes, template_set &templates) {
         if (c.before && c.after) {
             const std::uint32_t gained = *c.after & ~*c.before, lost = *c.before & ~*c.after;
             line += perms_of(*c.before, templates) + " -> " + perms_of(*c.after, templates) + " (";
-            if (gained)
-                line += "+" + perms_of(gained, templates) + (lost ? " " : "");
-            if (lost)
-                line += "-" + perms_of(lost, templates);
+            // Appended piece by piece: gcc 12 at -O3 warns (-Wrestrict) on
+            // a short literal added before a std::string.
+            if (gained) {
+                line += '+';
+                line += perms_of(gained, templates);
+                line += lost ? " " : "";
+            }
+            if (lost) {
+                line += '-';
+                line += perms_of(lost, templates);
+            }
             line += ")";
         } else {
             line += perms_of(c.before.value_or(c.after.value_or(0)), templates);

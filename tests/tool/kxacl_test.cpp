@@ -476,9 +476,12 @@ std::vector<std::string> lint_codes(const std::string &file) {
     const json warnings = json::parse(r.out)["warnings"];
     EXPECT_EQ(r.exit_code, warnings.empty() ? 0 : 1) << r.err;
     std::vector<std::string> codes;
-    for (const json &w : warnings)
-        codes.push_back(w["code"].get<std::string>() +
-                        (w["line"].is_null() ? "" : "@" + std::to_string(w["line"].get<int>())));
+    for (const json &w : warnings) {
+        std::string code = w["code"].get<std::string>();
+        if (!w["line"].is_null())
+            code += '@' + std::to_string(w["line"].get<int>());
+        codes.push_back(code);
+    }
     return codes;
 }
 
@@ -708,7 +711,7 @@ TEST_F(KxaclTool, EditingKeepsSetIdBitsOnlyOfTheRunningUsersFiles) {
     for (auto [owner, mode, kept] : {std::tuple{1u, 06777u, 0777u}, {0u, 04750u, 04750u}}) {
         ASSERT_EQ(::chown(buf.c_str(), owner, owner), 0);
         ASSERT_EQ(::chmod(buf.c_str(), mode), 0);
-        ASSERT_EQ(run_kxacl({"add", buf, "--group", "g" + std::to_string(owner)}).exit_code, 0);
+        ASSERT_EQ(run_kxacl({"add", buf, "--group", std::to_string(owner) + "g"}).exit_code, 0);
         EXPECT_EQ(kxtest::status_of(buf).st_mode & 07777, kept) << std::oct << mode;
     }
 }
