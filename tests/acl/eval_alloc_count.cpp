@@ -15,37 +15,7 @@
 
 #include "alloc.h"
 #include "eval_fixtures.h"
-
-extern "C" {
-void *__libc_malloc(std::size_t size);
-void *__libc_calloc(std::size_t count, std::size_t size);
-void *__libc_realloc(void *p, std::size_t size);
-}
-
-namespace {
-std::atomic<bool> counting{false};
-std::atomic<long> allocations{0};
-
-void note_allocation() {
-    if (counting.load(std::memory_order_relaxed))
-        allocations.fetch_add(1, std::memory_order_relaxed);
-}
-} // namespace
-
-extern "C" {
-void *malloc(std::size_t size) noexcept {
-    note_allocation();
-    return __libc_malloc(size);
-}
-void *calloc(std::size_t count, std::size_t size) noexcept {
-    note_allocation();
-    return __libc_calloc(count, size);
-}
-void *realloc(void *p, std::size_t size) noexcept {
-    note_allocation();
-    return __libc_realloc(p, size);
-}
-}
+#include "heap.h"
 
 namespace {
 
@@ -53,11 +23,9 @@ using namespace evaltest;
 
 // Counts the allocations of work().
 template <typename Work> long allocations_of(Work work) {
-    allocations = 0;
-    counting = true;
+    kxtest::heap::start_counting();
     work();
-    counting = false;
-    return allocations.load();
+    return kxtest::heap::stop_counting();
 }
 
 // Handlers that allocate nothing themselves: one compares like the plain

@@ -16,39 +16,7 @@
 
 #include "acl_fixtures.h"
 #include "file_helpers.h"
-
-extern "C" {
-void *__libc_malloc(std::size_t size);
-void *__libc_calloc(std::size_t count, std::size_t size);
-void *__libc_realloc(void *p, std::size_t size);
-}
-
-namespace {
-std::atomic<bool> armed{false};
-std::atomic<long> to_pass{0};
-std::atomic<bool> fired{false};
-
-bool refuse() {
-    if (!armed.load(std::memory_order_relaxed) || to_pass.fetch_sub(1) != 0)
-        return false;
-    armed = false;
-    fired = true;
-    errno = ENOMEM;
-    return true;
-}
-} // namespace
-
-extern "C" {
-void *malloc(std::size_t size) noexcept {
-    return refuse() ? nullptr : __libc_malloc(size);
-}
-void *calloc(std::size_t count, std::size_t size) noexcept {
-    return refuse() ? nullptr : __libc_calloc(count, size);
-}
-void *realloc(void *p, std::size_t size) noexcept {
-    return refuse() ? nullptr : __libc_realloc(p, size);
-}
-}
+#include "heap.h"
 
 namespace {
 
@@ -56,11 +24,9 @@ using namespace kxtest;
 
 // Runs f with allocation n of the process failing, counted from its start.
 template <typename F> kx_int32_t failing(long n, F f) {
-    fired = false;
-    to_pass = n;
-    armed = true;
+    kxtest::heap::fail_nth(n);
     kx_int32_t rc = f();
-    armed = false;
+    kxtest::heap::disarm();
     return rc;
 }
 
@@ -74,7 +40,7 @@ struct row {
 // False when the call made fewer than n + 1 allocations.
 bool with_failed_allocation(long n, const row &r) {
     kx_int32_t rc = r.call(n);
-    if (!fired)
+    if (!kxtest::heap::fired())
         return false;
     EXPECT_TRUE(rc == SEC_S_OK || rc == SEC_S_NO_MEMORY) << rc << " " << last_error().text;
     if (rc == SEC_S_NO_MEMORY) {

@@ -1,56 +1,13 @@
-// Running out of memory. This program replaces malloc, calloc and realloc
-// with versions that fail on request and otherwise pass to the C library;
-// libkx_cu's calls resolve to them. Sanitizers bring their own allocator,
-// so their builds skip these tests.
+// Running out of memory: the program's allocator (heap.h) fails every
+// allocation on request, libkx_cu's included.
 #include <gtest/gtest.h>
 
-#include <atomic>
-#include <cerrno>
 #include <cstring>
 #include <string>
 
 #include "cu_test_util.h"
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define CU_TEST_NO_MALLOC_HOOK 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer) ||                         \
-    __has_feature(memory_sanitizer)
-#define CU_TEST_NO_MALLOC_HOOK 1
-#endif
-#endif
-
-namespace cu_test {
-// Atomic with external linkage, so no compiler assumes calls leave it alone.
-std::atomic<bool> fail_allocations{false};
-} // namespace cu_test
-
-#ifndef CU_TEST_NO_MALLOC_HOOK
-extern "C" {
-void *__libc_malloc(size_t);
-void *__libc_calloc(size_t, size_t);
-void *__libc_realloc(void *, size_t);
-
-static bool refuse() {
-    if (!cu_test::fail_allocations.load())
-        return false;
-    errno = ENOMEM;
-    return true;
-}
-
-// Default visibility: the build hides symbols, and the dynamic linker must
-// see these to prefer them to the C library's.
-__attribute__((visibility("default"))) void *malloc(size_t n) {
-    return refuse() ? nullptr : __libc_malloc(n);
-}
-__attribute__((visibility("default"))) void *calloc(size_t n, size_t size) {
-    return refuse() ? nullptr : __libc_calloc(n, size);
-}
-__attribute__((visibility("default"))) void *realloc(void *p, size_t n) {
-    return refuse() ? nullptr : __libc_realloc(p, n);
-}
-}
-#endif
+#include "heap.h"
 
 namespace {
 
@@ -58,22 +15,15 @@ using cu_test::current_error;
 
 // Runs call with every allocation failing.
 template <typename F> auto without_memory(F call) {
-    cu_test::fail_allocations.store(true);
+    kxtest::heap::fail_all(true);
     auto result = call();
-    cu_test::fail_allocations.store(false);
+    kxtest::heap::fail_all(false);
     return result;
 }
 
 class OutOfMemoryTest : public ::testing::Test {
   protected:
-    void SetUp() override {
-#ifdef CU_TEST_NO_MALLOC_HOOK
-        GTEST_SKIP() << "allocation failures cannot be injected under a sanitizer";
-#endif
-    }
-    void TearDown() override {
-        cu_set_no_error_1();
-    }
+    void TearDown() override { cu_set_no_error_1(); }
 };
 
 // The texts are larger than any record before them, so that the block that

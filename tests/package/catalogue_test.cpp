@@ -12,7 +12,7 @@
 #include <kx_acl.h>
 #include <kx_cu.h>
 
-#include "tests/acl/support.h"
+#include "support.h"
 
 namespace {
 

@@ -3,8 +3,9 @@
 #include <clocale>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
-#include <sstream>
+#include <system_error>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
@@ -71,14 +72,39 @@ testing::AssertionResult record_is(int status, int msg_num, const std::vector<ar
     return failure << ": " << e.text;
 }
 
+namespace {
+
+// The directories that temp_dir made, removed at the exit of the process
+// that made them: a forked child that exits leaves them to its parent.
+struct made_directories {
+    pid_t owner = getpid();
+    std::vector<std::string> paths;
+    ~made_directories() {
+        if (getpid() != owner)
+            return;
+        for (const auto &path : paths) {
+            std::error_code ignored;
+            std::filesystem::remove_all(path, ignored);
+        }
+    }
+};
+
+made_directories &made() {
+    static made_directories dirs;
+    return dirs;
+}
+
+} // namespace
+
 std::string temp_dir() {
     const char *base = std::getenv("TMPDIR");
     std::string templ = std::string(base ? base : "/tmp") + "/kxacl-test-XXXXXX";
-    std::vector<char> buf(templ.begin(), templ.end());
-    buf.push_back('\0');
-    if (!mkdtemp(buf.data()))
+    if (!mkdtemp(templ.data())) {
         ADD_FAILURE() << "mkdtemp failed";
-    return buf.data();
+        return templ;
+    }
+    made().paths.push_back(templ);
+    return templ;
 }
 
 bool use_build_locale(const char *name) {
@@ -96,19 +122,62 @@ std::string start_tracing(const std::string &levels) {
     return file;
 }
 
+std::vector<std::string> read_lines(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::vector<std::string> lines;
+    for (std::string line; std::getline(in, line);)
+        lines.push_back(in.eof() ? line + "<no newline>" : line);
+    return lines;
+}
+
+namespace {
+bool only(const std::string &s, const char *allowed) {
+    return !s.empty() && s.find_first_not_of(allowed) == std::string::npos;
+}
+} // namespace
+
+std::optional<trace_line> parse_trace_line(const std::string &line) {
+    std::vector<std::string> f;
+    for (std::size_t start = 0, end = 0; end != std::string::npos; start = end + 1) {
+        end = line.find(' ', start);
+        f.push_back(line.substr(start, end - start));
+    }
+    const auto dot = f[0].find('.');
+    const char *digits = "0123456789";
+    if (f.size() < 4 || dot == std::string::npos || f[0].size() != dot + 10 ||
+        !only(f[0].substr(0, dot), digits) || !only(f[0].substr(dot + 1), digits) ||
+        !only(f[1], digits) || f[2].empty() || !only(f[3], digits))
+        return std::nullopt;
+    trace_line r{std::stoll(f[0].substr(0, dot)),
+                 std::stoll(f[0].substr(dot + 1)),
+                 std::stoll(f[1]),
+                 f[2],
+                 std::stoull(f[3]),
+                 {f.begin() + 4, f.end()}};
+    for (const auto &item : r.items)
+        if (item != "-" && (!only(item, "0123456789abcdef") || item.size() % 2 != 0))
+            return std::nullopt;
+    return r;
+}
+
+std::vector<trace_line> read_trace_lines(const std::string &file) {
+    std::vector<trace_line> records;
+    for (const auto &line : read_lines(file)) {
+        if (auto r = parse_trace_line(line))
+            records.push_back(*r);
+        else
+            ADD_FAILURE() << "malformed record line: " << line;
+    }
+    return records;
+}
+
 std::vector<trace_record> read_trace(const std::string &file) {
     std::vector<trace_record> records;
-    std::ifstream in(file);
-    std::string line;
-    while (std::getline(in, line)) {
-        std::istringstream words(line);
-        std::string time, thread, component;
-        trace_record r;
-        words >> time >> thread >> component >> r.id;
-        if (component != "_SEL")
+    for (const auto &line : read_trace_lines(file)) {
+        if (line.component != "_SEL")
             continue;
-        std::string item;
-        while (words >> item)
+        trace_record r{static_cast<unsigned>(line.id), {}};
+        for (const auto &item : line.items)
             r.items.push_back(item == "-" ? "" : item);
         records.push_back(r);
     }
@@ -131,6 +200,10 @@ std::string hex_of(const void *p, std::size_t n) {
         s += digits[b & 15];
     }
     return s;
+}
+
+std::string trace_item(const void *p, std::size_t n) {
+    return n == 0 ? "-" : hex_of(p, n);
 }
 
 std::string hex_text(const std::string &s) {

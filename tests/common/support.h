@@ -1,8 +1,10 @@
-// Helpers of the library's tests: reading the thread's error record back
-// and checking it, and reading trace records from a trace file.
+// Helpers shared by the tests of the three libraries and of the tool: the
+// thread's error record read back and checked, trace files read back with
+// a strict parse of each line, hex forms, and temporary directories.
 #ifndef KXACL_TEST_SUPPORT_H
 #define KXACL_TEST_SUPPORT_H
 
+#include <optional>
 #include <string>
 #include <variant>
 #include <vector>
@@ -34,7 +36,25 @@ error_record last_error();
 using arg = std::variant<long long, std::string>;
 testing::AssertionResult record_is(int status, int msg_num, const std::vector<arg> &args);
 
-// One record of the trace file: its id and its items as hex texts.
+// One record line of a trace file: "<s>.<9 digits> <tid> <component>
+// <id>", then items that are "-" or lowercase hex pairs, all separated by
+// single spaces. Items are kept as written.
+struct trace_line {
+    long long seconds = 0, nanoseconds = 0, thread = 0;
+    std::string component;
+    unsigned long long id = 0;
+    std::vector<std::string> items;
+};
+std::optional<trace_line> parse_trace_line(const std::string &line);
+
+// The lines of a file; a last line without its newline is marked.
+std::vector<std::string> read_lines(const std::string &path);
+
+// Every record of a trace file; a line not of the record format fails the
+// test.
+std::vector<trace_line> read_trace_lines(const std::string &file);
+
+// The records of the ACL library's component, with "-" items as empty texts.
 struct trace_record {
     unsigned id = 0;
     std::vector<std::string> items;
@@ -46,14 +66,18 @@ std::string start_tracing(const std::string &levels);
 std::vector<trace_record> read_trace(const std::string &file);
 std::vector<unsigned> trace_ids(const std::string &file);
 
-// The hex form of a value's bytes, as the trace file writes items.
+// The hex form of a value's bytes, as the trace file writes items (an
+// empty item is written "-": see trace_item).
 std::string hex_of(const void *p, std::size_t n);
 template <typename T> std::string hex_of(const T &v) {
     return hex_of(&v, sizeof v);
 }
 std::string hex_text(const std::string &s); // with its NUL
+std::string trace_item(const void *p, std::size_t n);
 
-// A fresh empty directory under the test temporary directory.
+// A fresh empty directory under the test temporary directory. Every
+// directory made so is removed, with its contents, when the process that
+// made it exits (each test runs in a process of its own).
 std::string temp_dir();
 
 // Makes name, one of the locales that the build makes for the tests (see
