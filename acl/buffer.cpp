@@ -40,41 +40,40 @@ kx_int32_t read_acl_from_data(kx_int32_t length, unsigned char *buffer, sec_acl_
 }
 
 // Reverses the multi-byte fields of a buffer of the other byte order, in
-// place, walking by the converted counts and lengths. Every field is checked
-// to lie within the buffer before it is touched; a walk that would leave the
-// buffer stops with 2650-110 and leaves the buffer partly converted.
+// place, walking by the converted counts and lengths: each header and record
+// is reversed just before the walk reads it, once it is known to lie within
+// the buffer. A walk that would leave the buffer, or a sub-ACL that does not
+// start where the records of the one before end, stops with 2650-110 and
+// leaves the buffer partly converted.
 kx_int32_t reverse_fields(unsigned char *data, std::size_t size) {
     if (size < layout::header_size)
         return report_corrupt(here(src_acl));
     reverse_u16(data + layout::at_subacl_count);
-    unsigned count = load_u16(data + layout::at_subacl_count);
-    std::size_t offset = layout::header_size, expected_end = 0;
-    for (unsigned i = 0; i < count; ++i) {
-        if ((i > 0 && offset != expected_end) || size - offset < layout::subacl_header_size)
-            return report_corrupt(here(src_acl));
-        unsigned char *sub = data + offset;
-        reverse_u32(sub + layout::at_subacl_length);
-        reverse_u32(sub + layout::at_acle_count);
-        expected_end = offset + load_u32(sub + layout::at_subacl_length);
-        std::uint32_t entries = load_u32(sub + layout::at_acle_count);
-        std::size_t header = layout::subacl_header_size + sub[layout::at_mech_length];
-        if (size - offset < header)
-            return report_corrupt(here(src_acl));
-        offset += header;
-        for (std::uint32_t n = 0; n < entries; ++n) {
-            if (size - offset < layout::acle_header_size)
+    const acl_bytes b{data, size};
+    // The walks hand out read-only places within data, which is ours.
+    auto writable = [&](const unsigned char *p) { return data + (p - data); };
+    auto reverse_subacl_header = [&](const unsigned char *p) {
+        reverse_u32(writable(p) + layout::at_subacl_length);
+        reverse_u32(writable(p) + layout::at_acle_count);
+    };
+    auto reverse_record = [&](const unsigned char *p) {
+        reverse_u32(writable(p) + layout::at_perm);
+        reverse_u16(writable(p) + layout::at_id_length);
+    };
+    kx_int32_t rc = walk_subacls(
+        b, records_bound::buffer_length,
+        [&](const subacl_view &v, acl_bytes records, bool last) {
+            std::size_t end = 0;
+            kx_int32_t walked = walk_acles(
+                records, v, [](const acle_record &) { return SEC_S_OK; }, &end, reverse_record);
+            if (walked == SEC_S_OK && !last && !records_end_where_length_says(v, end))
                 return report_corrupt(here(src_acl));
-            unsigned char *entry = data + offset;
-            reverse_u32(entry + layout::at_perm);
-            reverse_u16(entry + layout::at_id_length);
-            std::size_t record = layout::acle_header_size + load_u16(entry + layout::at_id_length);
-            if (size - offset < record)
-                return report_corrupt(here(src_acl));
-            offset += record;
-        }
-    }
-    data[layout::at_byte_order] = layout::host_order;
-    return SEC_S_OK;
+            return walked;
+        },
+        reverse_subacl_header);
+    if (rc == SEC_S_OK)
+        data[layout::at_byte_order] = layout::host_order;
+    return rc;
 }
 
 kx_int32_t convert_acl_to_host(sec_boolean_t verify, sec_acl_buffer_t acl) {

@@ -63,16 +63,12 @@ bool subacl_length_covers_header(const subacl_view &v) {
     return v.length >= v.first_entry - v.offset;
 }
 
-acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last) {
-    return {b.data, last ? b.size : std::min(b.size, v.end())};
-}
-
-bool acle_view::id_well_formed() const {
+bool acle_record::id_well_formed() const {
     // Bounded: a field without NUL may end the buffer.
     return id_length > 0 && strnlen(id, id_length) + 1 == id_length;
 }
 
-bool acle_view::id_terminated() const {
+bool acle_record::id_terminated() const {
     return id_length > 0 && std::memchr(id, '\0', id_length) != nullptr;
 }
 
@@ -102,10 +98,10 @@ kx_int32_t report_corrupt(source_pos pos) {
 namespace {
 
 // Checks one entry of a validated sub-ACL of the given type.
-kx_int32_t check_acle(const acle_view &e, unsigned char type) {
-    if (e.version != layout::acle_version) {
+kx_int32_t check_acle(const acle_record &e, unsigned char type) {
+    if (e.version() != layout::acle_version) {
         source_pos pos = here(src_acl);
-        return report<MSG_2650_125>(SEC_S_BAD_ACLE, e.version, pos.file, pos.line);
+        return report<MSG_2650_125>(SEC_S_BAD_ACLE, e.version(), pos.file, pos.line);
     }
     if (!type_has_id(type) && e.id_length != 0) {
         source_pos pos = here(src_acl);
@@ -153,62 +149,49 @@ kx_int32_t check_subacl_header(const subacl_view &v) {
 
 } // namespace
 
+bool records_end_where_length_says(const subacl_view &v, std::size_t records_end) {
+    return records_end == v.end();
+}
+
 kx_int32_t sec__check_acl_buffer(sec_acl_buffer_t acl) {
     if (acl->length < static_cast<kx_int32_t>(layout::header_size)) {
         source_pos pos = here(src_acl);
         return report<MSG_2650_119>(SEC_S_BAD_ACL, acl->length, pos.file, pos.line);
     }
     acl_bytes b = bytes_of(*acl);
-    std::size_t offset = layout::header_size;
-    std::size_t expected_end = 0;
-    unsigned count = subacl_count(b);
-    for (unsigned i = 0; i < count; ++i) {
-        subacl_view v;
-        // Each sub-ACL must start where the previous one's length says and
-        // lie within the buffer, which also catches lengths past the end.
-        if ((i > 0 && offset != expected_end) || !read_subacl(b, offset, &v))
-            return report_corrupt(here(src_acl));
-        kx_int32_t rc = check_subacl_header(v);
-        if (rc != SEC_S_OK)
-            return rc;
-        offset = v.first_entry;
-        for (std::uint32_t n = 0; n < v.count; ++n) {
-            acle_view e;
-            if (!read_acle(b, offset, &e))
-                return report_corrupt(here(src_acl));
-            rc = check_acle(e, v.type);
+    return walk_subacls(
+        b, records_bound::buffer_length, [&](const subacl_view &v, acl_bytes records, bool last) {
+            kx_int32_t rc = check_subacl_header(v);
+            std::size_t end = 0;
+            if (rc == SEC_S_OK)
+                rc = walk_acles(
+                    records, v, [&](const acle_record &e) { return check_acle(e, v.type); }, &end);
             if (rc != SEC_S_OK)
                 return rc;
-            offset = e.next;
-        }
-        expected_end = v.end();
-        if (expected_end > b.size)
-            return report_corrupt(here(src_acl));
-    }
-    return SEC_S_OK;
+            // Each sub-ACL is followed by the next where its
+            // length says, and lies within the buffer.
+            if ((!last && !records_end_where_length_says(v, end)) || v.end() > b.size)
+                return report_corrupt(here(src_acl));
+            return SEC_S_OK;
+        });
 }
 
 kx_int32_t find_subacl_view(const sec_buffer_s &acl, unsigned char type, const char *mech,
                             subacl_view *v, bool *found) {
     *found = false;
+    *v = subacl_view{};
     acl_bytes b = bytes_of(acl);
-    std::size_t offset = layout::header_size;
-    unsigned count = subacl_count(b);
     std::size_t mech_size = type_has_mech(type) && mech ? std::strlen(mech) + 1 : 0;
-    for (unsigned i = 0; i < count; ++i) {
-        if (!read_subacl(b, offset, v))
-            return report_corrupt(here(src_acl));
-        if (v->type == type && (!type_has_mech(type) || subacl_mech_equals(*v, mech, mech_size))) {
-            if (v->end() > b.size)
+    return walk_subacls(
+        b, records_bound::buffer_length, [&](const subacl_view &s, acl_bytes, bool) {
+            if (s.type != type || (type_has_mech(type) && !subacl_mech_equals(s, mech, mech_size)))
+                return SEC_S_OK;
+            if (s.end() > b.size)
                 return report_corrupt(here(src_acl));
+            *v = s;
             *found = true;
-            return SEC_S_OK;
-        }
-        if (i + 1 < count && !subacl_length_covers_header(*v))
-            return report_corrupt(here(src_acl));
-        offset = v->end();
-    }
-    return SEC_S_OK;
+            return walk_stop;
+        });
 }
 
 kx_int32_t sec__find_subacl(const sec_acl_buffer_t acl, const unsigned char type, const char *mech,

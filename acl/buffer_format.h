@@ -88,6 +88,9 @@ kx_int32_t check_read_header(const sec_buffer_s &acl);
 
 std::uint16_t subacl_count(acl_bytes b);
 
+// 2650-110: the lengths of a buffer do not agree with its contents.
+kx_int32_t report_corrupt(source_pos pos);
+
 // One sub-ACL header, read within the buffer.
 struct subacl_view {
     std::size_t offset;   // of its length field
@@ -110,41 +113,128 @@ bool read_subacl(acl_bytes b, std::size_t offset, subacl_view *v);
 // same sub-ACL, as many times as the count says), so no sub-ACL can follow.
 bool subacl_length_covers_header(const subacl_view &v);
 
-// The bytes that the records of sub-ACL v may lie in when all the sub-ACLs
-// are walked: up to where the next one starts, and for the last one up to
-// the buffer's end (validation bounds only the others). Overlapping
-// sub-ACLs would otherwise have their records read once for each of them,
-// at a cost that grows with the square of the buffer's length.
-acl_bytes subacl_records_bytes(acl_bytes b, const subacl_view &v, bool last);
+// ---- walks -----------------------------------------------------------------
+//
+// Every reader of a buffer walks it through the two walks below: the
+// sub-ACLs one after the other by their lengths, and the records of one
+// sub-ACL one after the other by their identifier lengths. Counts and
+// lengths are never trusted: whatever the rule, a header or record that
+// would run past the bytes the walk may read ends it with 2650-110.
 
-// One entry, read within the buffer.
-struct acle_view {
-    unsigned char version;
-    std::uint32_t perm;
-    std::uint16_t id_length;
-    const char *id; // id_length bytes, or null when there are none
-    std::size_t next;
+// Returned by a visitor to end a walk early and successfully; never a status.
+inline constexpr kx_int32_t walk_stop = -1;
+
+// Where the records of a sub-ACL may lie.
+enum class records_bound {
+    // Anywhere up to the buffer's length.
+    buffer_length,
+    // Up to where the next sub-ACL starts by this one's length; the last
+    // one's up to the buffer's length. A walk of all the sub-ACLs uses it,
+    // so that overlapping sub-ACLs do not have their records read once for
+    // each of them, at a cost that grows with the square of the length.
+    next_subacl,
+};
+
+// The bytes that the records of sub-ACL v (the last one when last) may lie in.
+inline acl_bytes records_bytes(acl_bytes b, const subacl_view &v, records_bound bound, bool last) {
+    if (bound == records_bound::buffer_length || last)
+        return b;
+    return {b.data, v.end() < b.size ? v.end() : b.size};
+}
+
+// Turns a visitor's result into the walk's: walk_stop ends it successfully.
+inline kx_int32_t walk_result(kx_int32_t rc) {
+    return rc == walk_stop ? SEC_S_OK : rc;
+}
+
+// Calls visit(v, records, last) for each sub-ACL in buffer order, records
+// being the bytes its records may lie in by bound, until visit returns
+// anything but SEC_S_OK. The header of b must have been accepted. A sub-ACL
+// whose length does not cover its own header can have no sub-ACL after it.
+// prepare(p) is called on each sub-ACL header before it is read (conversion
+// from the other byte order reverses its fields there).
+struct no_prepare {
+    void operator()(const unsigned char *) const {}
+};
+template <typename Visit, typename Prepare = no_prepare>
+kx_int32_t walk_subacls(acl_bytes b, records_bound bound, Visit visit, Prepare prepare = {}) {
+    const unsigned count = subacl_count(b);
+    std::size_t offset = layout::header_size;
+    for (unsigned i = 0; i < count; ++i) {
+        const bool last = i + 1 == count;
+        if (offset <= b.size && b.size - offset >= layout::subacl_header_size)
+            prepare(b.data + offset);
+        subacl_view v;
+        if (!read_subacl(b, offset, &v))
+            return report_corrupt(here(src_acl));
+        kx_int32_t rc = visit(v, records_bytes(b, v, bound, last), last);
+        if (rc != SEC_S_OK)
+            return walk_result(rc);
+        if (!last && !subacl_length_covers_header(v))
+            return report_corrupt(here(src_acl));
+        offset = v.end();
+    }
+    return SEC_S_OK;
+}
+
+// One record met by a walk. The identifier field is id_length bytes at id;
+// readable is how many bytes may be read from id on (to the end of the
+// walk's bytes: comparisons read eight at a time). Fields other than the
+// identifier length are read only when wanted.
+struct acle_record {
+    const unsigned char *at;
+    std::size_t id_length;
+    const char *id;
+    std::size_t readable;
+    unsigned char version() const { return at[layout::at_acle_version]; }
+    std::uint32_t perm() const { return load_u32(at + layout::at_perm); }
     // The identifier is a text ending at its last byte: the form writers make.
     bool id_well_formed() const;
     // The identifier holds a NUL within its bytes, so it can be read as a text.
     bool id_terminated() const;
+    // The identifier ends in its NUL: checking that one byte keeps a walk to
+    // a single pass over the identifier, the comparison's own.
+    bool id_ends_in_nul() const { return id_length != 0 && id[id_length - 1] == '\0'; }
 };
 
-// Reads the entry at offset; false when it does not fit in b. Inline: the
-// walks of evaluation call it once per entry.
-inline bool read_acle(acl_bytes b, std::size_t offset, acle_view *v) {
-    if (offset > b.size || b.size - offset < layout::acle_header_size)
-        return false;
-    const unsigned char *p = b.data + offset;
-    v->version = p[layout::at_acle_version];
-    v->perm = load_u32(p + layout::at_perm);
-    v->id_length = load_u16(p + layout::at_id_length);
-    if (b.size - offset - layout::acle_header_size < v->id_length)
-        return false;
-    v->id = v->id_length ? reinterpret_cast<const char *>(p + layout::at_id) : nullptr;
-    v->next = offset + layout::acle_header_size + v->id_length;
-    return true;
+// Calls visit(record) for the records of sub-ACL v in stored order, within
+// records (from records_bytes), until visit returns anything but SEC_S_OK.
+// When the walk ends with every record visited, *end is where the last one
+// ends. prepare(p) is called on each record before it is read. Inline: the
+// walks of evaluation, on the path of every request, step through it by
+// pointer, every record's place depending on the length read from the one
+// before.
+template <typename Visit, typename Prepare = no_prepare>
+kx_int32_t walk_acles(acl_bytes records, const subacl_view &v, Visit visit,
+                      std::size_t *end = nullptr, Prepare prepare = {}) {
+    const unsigned char *const limit = records.data + records.size;
+    if (v.count != 0 && v.first_entry > records.size)
+        return report_corrupt(here(src_acl));
+    const unsigned char *at = records.data + v.first_entry;
+    for (std::uint32_t left = v.count; left != 0; --left) {
+        if (static_cast<std::size_t>(limit - at) < layout::acle_header_size)
+            return report_corrupt(here(src_acl));
+        prepare(at);
+        const std::size_t id_length = load_u16(at + layout::at_id_length);
+        const unsigned char *id = at + layout::at_id;
+        const auto readable = static_cast<std::size_t>(limit - id);
+        if (id_length > readable)
+            return report_corrupt(here(src_acl));
+        kx_int32_t rc =
+            visit(acle_record{at, id_length, reinterpret_cast<const char *>(id), readable});
+        if (rc != SEC_S_OK)
+            return walk_result(rc);
+        at = id + id_length;
+    }
+    if (end)
+        *end = static_cast<std::size_t>(at - records.data);
+    return SEC_S_OK;
 }
+
+// The records of sub-ACL v, walked to records_end, end where its length
+// says: the rule of every sub-ACL but the last in a valid buffer, where the
+// next one starts.
+bool records_end_where_length_says(const subacl_view &v, std::size_t records_end);
 
 // The mechanism of a user or expanded sub-ACL equals mech (of mech_size
 // bytes, its NUL included), ignoring case.
@@ -167,9 +257,6 @@ kx_int32_t find_subacl_view(const sec_buffer_s &acl, unsigned char type, const c
 // Makes acl own a new buffer without sub-ACLs; false when memory ran out,
 // with acl untouched. Reports nothing: callers name their own routine.
 bool new_empty_buffer(sec_buffer_s *acl);
-
-// 2650-110: the lengths of a buffer do not agree with its contents.
-kx_int32_t report_corrupt(source_pos pos);
 
 } // namespace kxacl
 

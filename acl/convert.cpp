@@ -32,10 +32,10 @@ kx_int32_t subacl_mech(const subacl_view &v, const char **mech) {
 
 // Adds the entry of one record to the tree, which copies it: the record's
 // identifier is used where it stands in the buffer.
-kx_int32_t add_record(const subacl_view &v, const char *mech, const acle_view &e,
+kx_int32_t add_record(const subacl_view &v, const char *mech, const acle_record &e,
                       sec_acltree_t *tree) {
     sec_acle_desc entry{};
-    entry.perm = e.perm;
+    entry.perm = e.perm();
     entry.type = v.type;
     std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
     if (type_has_id(v.type)) {
@@ -110,16 +110,8 @@ kx_int32_t sec__subacl_to_acltree(acl_bytes b, const subacl_view &v, sec_acltree
         return report<MSG_2650_111>(SEC_S_BAD_ACL);
     const char *mech = nullptr;
     kx_int32_t rc = subacl_mech(v, &mech);
-    std::size_t offset = v.first_entry;
-    for (std::uint32_t i = 0; rc == SEC_S_OK && i < v.count; ++i) {
-        acle_view e;
-        if (!read_acle(b, offset, &e)) {
-            rc = report_corrupt(here(src_acl));
-        } else {
-            rc = add_record(v, mech, e, tree);
-            offset = e.next;
-        }
-    }
+    if (rc == SEC_S_OK)
+        rc = walk_acles(b, v, [&](const acle_record &e) { return add_record(v, mech, e, tree); });
     if (rc != SEC_S_OK) {
         sec__free_acltree(*tree);
         *tree = nullptr;
@@ -206,7 +198,7 @@ kx_int32_t append_copy(sec_acle_list_t list, const sec_acle_desc &acle, const ch
 
 // The length of the identifier of record e with its NUL, which lies in the
 // field (id_terminated).
-std::size_t id_size_of(const acle_view &e) {
+std::size_t id_size_of(const acle_record &e) {
     return static_cast<std::size_t>(std::find(e.id, e.id + e.id_length, '\0') - e.id) + 1;
 }
 
@@ -219,19 +211,19 @@ bool strictly_ascending(acl_bytes b, const subacl_view &v) {
         return false;
     const char *previous = nullptr;
     std::size_t previous_size = 0;
-    std::size_t offset = v.first_entry;
-    for (std::uint32_t i = 0; i < v.count; ++i) {
-        acle_view e;
-        if (!read_acle(b, offset, &e) || !e.id_terminated())
-            return false;
-        std::size_t size = id_size_of(e);
-        if (previous && kx::posix_case::compare(previous, previous_size, e.id, size) >= 0)
-            return false;
+    bool ascending = true;
+    kx_int32_t rc = walk_acles(b, v, [&](const acle_record &e) {
+        ascending = e.id_terminated() &&
+                    (!previous ||
+                     kx::posix_case::compare(previous, previous_size, e.id, id_size_of(e)) < 0);
         previous = e.id;
-        previous_size = size;
-        offset = e.next;
-    }
-    return true;
+        previous_size = ascending ? id_size_of(e) : 0;
+        return ascending ? SEC_S_OK : walk_stop;
+    });
+    // A record past the end is left for the tree's walk to report.
+    if (rc != SEC_S_OK)
+        cu_set_no_error_1();
+    return rc == SEC_S_OK && ascending;
 }
 
 // Appends the entries of such a sub-ACL as they stand.
@@ -241,16 +233,12 @@ kx_int32_t append_ascending(acl_bytes b, const subacl_view &v, const char *mech,
     sec_acle_desc entry{};
     entry.type = v.type;
     std::memcpy(entry.mech, mech, std::strlen(mech) + 1);
-    std::size_t offset = v.first_entry;
-    for (std::uint32_t i = 0; rc == SEC_S_OK && i < v.count; ++i) {
-        acle_view e;
-        if (!read_acle(b, offset, &e)) // read once already: never taken
-            return report_corrupt(here(src_acl));
-        entry.perm = e.perm;
-        rc = append_copy(list, entry, e.id, id_size_of(e));
-        offset = e.next;
-    }
-    return rc;
+    if (rc != SEC_S_OK)
+        return rc;
+    return walk_acles(b, v, [&](const acle_record &e) {
+        entry.perm = e.perm();
+        return append_copy(list, entry, e.id, id_size_of(e));
+    });
 }
 
 } // namespace

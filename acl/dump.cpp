@@ -164,20 +164,11 @@ extern "C" ACL_EXTERN void sec__dump_acl(sec_acl_buffer_t acl) noexcept {
                          b.data[layout::at_version], b.data[layout::at_byte_order], count);
     print_record(stderr, trailing_newline::no);
 
-    std::size_t offset = layout::header_size;
-    for (unsigned i = 0; i < count; ++i) {
-        subacl_view v;
-        if (!read_subacl(b, offset, &v)) {
-            report_corrupt(here(src_acl));
-            print_failure();
-            return;
-        }
-        sec__dump_subacl(subacl_records_bytes(b, v, i + 1 == count), v, "\t");
-        if (!subacl_length_covers_header(v)) {
-            report_corrupt(here(src_acl));
-            print_failure();
-            return;
-        }
-        offset = v.end();
-    }
+    kx_int32_t rc = walk_subacls(b, records_bound::next_subacl,
+                                 [](const subacl_view &v, acl_bytes records, bool) {
+                                     sec__dump_subacl(records, v, "\t");
+                                     return SEC_S_OK;
+                                 });
+    if (rc != SEC_S_OK)
+        print_failure();
 }

@@ -128,43 +128,17 @@ kx_int32_t no_entry(unsigned char type, const char *mech, const char *id) {
     return report<MSG_2650_147>(SEC_S_BAD_ACLE, type, mech, id);
 }
 
-enum class walk { next, stop };
-
-// One entry met by a walk: its identifier, which ends in its NUL, the bytes
-// that may be read from the identifier on (up to the end of the buffer,
-// which lets comparisons read eight bytes at a time), and its mask, read
-// only when it is wanted.
-struct entry_ref {
-    const unsigned char *record;
-    const char *id;
-    std::size_t readable;
-    kx_uint32_t perm() const { return load_u32(record + layout::at_perm); }
-};
-
 // Calls visit(entry) for the entries of sub-ACL v in stored order until it
-// says stop. Counts and lengths are not trusted: a record that runs past the
-// end of the buffer, or an identifier that does not end in its NUL, ends the
-// walk with 2650-110 instead of being read. Checking that one byte keeps the
-// walk to a single pass over each identifier, the comparison's own; a field
-// without that NUL is not what any writer makes (validation refuses it with
-// 2650-127). The walk steps by pointer: every record's place depends on the
-// length read from the one before, and that chain bounds its speed.
+// returns anything but SEC_S_OK. An identifier that does not end in its NUL
+// ends the walk with 2650-110 instead of being read as a text: no writer
+// makes one (validation refuses it with 2650-127), and checking that one
+// byte keeps the walk to a single pass over each identifier, the
+// comparison's own. Records may be read to the buffer's end, which lets
+// comparisons read eight bytes at a time.
 template <typename Visit> kx_int32_t walk_entries(acl_bytes b, const subacl_view &v, Visit visit) {
-    const unsigned char *record = b.data + v.first_entry;
-    const unsigned char *const end = b.data + b.size;
-    for (std::uint32_t left = v.count; left != 0; --left) {
-        if (static_cast<std::size_t>(end - record) < layout::acle_header_size)
-            return report_corrupt(here(src_acl));
-        std::size_t id_length = load_u16(record + layout::at_id_length);
-        const unsigned char *id = record + layout::at_id;
-        auto readable = static_cast<std::size_t>(end - id);
-        if (id_length == 0 || id_length > readable || id[id_length - 1] != '\0')
-            return report_corrupt(here(src_acl));
-        if (visit(entry_ref{record, reinterpret_cast<const char *>(id), readable}) == walk::stop)
-            break;
-        record = id + id_length;
-    }
-    return SEC_S_OK;
+    return walk_acles(b, v, [&](const acle_record &e) {
+        return e.id_ends_in_nul() ? visit(e) : report_corrupt(here(src_acl));
+    });
 }
 
 // The requester's identity or group name, prepared for comparison with
@@ -176,12 +150,12 @@ posix_case::prepared_text prepared(const char *text) {
 // One step of a walk of user or group entries, which stand in ascending
 // order, by the order r of the requester against the entry: equal, the
 // entry's mask is ORed into *mask; sorting after it, the walk goes on.
-walk ordered_step(int r, const entry_ref &e, kx_uint32_t *mask, bool *matched) {
+kx_int32_t ordered_step(int r, const acle_record &e, kx_uint32_t *mask, bool *matched) {
     if (r == 0) {
         *mask |= e.perm();
         *matched = true;
     }
-    return r > 0 ? walk::next : walk::stop;
+    return r > 0 ? SEC_S_OK : walk_stop;
 }
 
 // The walk of user or group entries for a requester compared as text: the
@@ -191,14 +165,14 @@ walk ordered_step(int r, const entry_ref &e, kx_uint32_t *mask, bool *matched) {
 [[gnu::noinline]] kx_int32_t ordered_walk(acl_bytes b, const subacl_view &v, const char *requester,
                                           kx_uint32_t *mask, bool *matched) {
     const posix_case::prepared_text wanted = prepared(requester);
-    return walk_entries(b, v, [&](const entry_ref &e) {
+    return walk_entries(b, v, [&](const acle_record &e) {
         return ordered_step(wanted.order(e.id, e.readable), e, mask, matched);
     });
 }
 
 // Asks a handler about one entry. A handler may leave a record about a
 // mismatch; it must not outlive the mismatch.
-kx_int32_t ask_handler(sec_acl_id_handler handler, char *id, const entry_ref &e) {
+kx_int32_t ask_handler(sec_acl_id_handler handler, char *id, const acle_record &e) {
     kx_int32_t r = handler(id, const_cast<char *>(e.id));
     if (r != 0)
         cu_set_no_error_1();
@@ -244,11 +218,10 @@ kx_int32_t single_entry_perm(acl_bytes b, const subacl_view &v, unsigned char ty
     // caller data may hold one: it answers like a missing sub-ACL.
     if (v.count == 0)
         return no_entry(type, mech, "");
-    acle_view e;
-    if (!read_acle(b, v.first_entry, &e))
-        return report_corrupt(here(src_acl));
-    *perm = e.perm;
-    return SEC_S_OK;
+    return walk_acles(b, v, [&](const acle_record &e) {
+        *perm = e.perm();
+        return walk_stop;
+    });
 }
 
 // User entries stand in ascending order, so a requester that sorts before
@@ -261,7 +234,7 @@ kx_int32_t user_perm(acl_bytes b, const subacl_view &v, unsigned char type, char
         (void)sec__get_id_handler(SEC_ID_HANDLER_USER, mech, &handler);
     bool matched = false;
     kx_int32_t rc = handler ? walk_entries(b, v,
-                                           [&](const entry_ref &e) {
+                                           [&](const acle_record &e) {
                                                return ordered_step(ask_handler(handler, id, e), e,
                                                                    perm, &matched);
                                            })
@@ -280,12 +253,12 @@ kx_int32_t expanded_perm(acl_bytes b, const subacl_view &v, unsigned char type, 
     if (!handler)
         return no_entry(type, mech, id);
     bool matched = false;
-    kx_int32_t rc = walk_entries(b, v, [&](const entry_ref &e) {
+    kx_int32_t rc = walk_entries(b, v, [&](const acle_record &e) {
         if (ask_handler(handler, id, e) != 0)
-            return walk::next;
+            return SEC_S_OK;
         *perm = e.perm();
         matched = true;
-        return walk::stop;
+        return walk_stop;
     });
     if (rc != SEC_S_OK || matched)
         return rc;

@@ -25,24 +25,10 @@ bool is_empty_acl(const sec_buffer_s &acl) {
 // Appends the entries of every sub-ACL that wanted() accepts, in buffer order.
 template <typename Wanted>
 kx_int32_t append_subacls(const sec_buffer_s &acl, sec_acle_list_t list, Wanted wanted) {
-    acl_bytes b = bytes_of(acl);
-    std::size_t offset = layout::header_size;
-    unsigned count = subacl_count(b);
-    for (unsigned i = 0; i < count; ++i) {
-        subacl_view v;
-        if (!read_subacl(b, offset, &v))
-            return report_corrupt(here(src_acl));
-        if (wanted(v)) {
-            acl_bytes records = subacl_records_bytes(b, v, i + 1 == count);
-            kx_int32_t rc = append_subacl_to_list(records, v, list);
-            if (rc != SEC_S_OK)
-                return rc;
-        }
-        if (i + 1 < count && !subacl_length_covers_header(v))
-            return report_corrupt(here(src_acl));
-        offset = v.end();
-    }
-    return SEC_S_OK;
+    return walk_subacls(bytes_of(acl), records_bound::next_subacl,
+                        [&](const subacl_view &v, acl_bytes records, bool) {
+                            return wanted(v) ? append_subacl_to_list(records, v, list) : SEC_S_OK;
+                        });
 }
 
 void release_list(sec_acle_list_t list) {
@@ -196,28 +182,30 @@ kx_int32_t splice(sec_buffer_s &acl, std::size_t offset, std::size_t old_length,
 
 // Where a new sub-ACL goes: right after the last sub-ACL, ahead of any
 // bytes that follow it (validation leaves those alone), so that a walk by
-// the sub-ACL lengths reaches it. False when the last sub-ACL's records do
-// not end where its length says: validation compares the two only for a
+// the sub-ACL lengths reaches it. 2650-110 when the last sub-ACL's records
+// do not end where its length says: validation compares the two only for a
 // sub-ACL that another one follows, so one added after it would make the
 // buffer invalid.
-bool end_of_subacls(const sec_buffer_s &acl, std::size_t *end) {
+kx_int32_t end_of_subacls(const sec_buffer_s &acl, std::size_t *end) {
     acl_bytes b = bytes_of(acl);
-    unsigned count = subacl_count(b);
     *end = layout::header_size;
-    if (count == 0)
-        return true;
-    subacl_view v;
-    for (unsigned i = 0; i < count; ++i, *end = v.end())
-        if (!read_subacl(b, *end, &v))
-            return false;
-    std::size_t records_end = v.first_entry;
-    for (std::uint32_t n = 0; n < v.count && records_end <= *end; ++n) {
-        acle_view e;
-        if (!read_acle(b, records_end, &e))
-            return false;
-        records_end = e.next;
-    }
-    return records_end == *end && *end <= b.size;
+    subacl_view last{};
+    acl_bytes last_records{};
+    kx_int32_t rc = walk_subacls(b, records_bound::buffer_length,
+                                 [&](const subacl_view &v, acl_bytes records, bool) {
+                                     last = v;
+                                     last_records = records;
+                                     *end = v.end();
+                                     return SEC_S_OK;
+                                 });
+    if (rc != SEC_S_OK || subacl_count(b) == 0)
+        return rc;
+    std::size_t records_end = 0;
+    rc = walk_acles(
+        last_records, last, [](const acle_record &) { return SEC_S_OK; }, &records_end);
+    if (rc == SEC_S_OK && (!records_end_where_length_says(last, records_end) || *end > b.size))
+        return report_corrupt(here(src_acl));
+    return rc;
 }
 
 // The sub-ACL of acle's key written back after a change; when the buffer
@@ -235,8 +223,8 @@ kx_int32_t write_back(sec_buffer_s &acl, const edited_subacl &s, const char *rou
         if (stored_subacl_count(acl) == layout::max_subacls)
             return no_memory(routine, static_cast<std::size_t>(acl.length) + fresh_length);
         std::size_t end = 0;
-        if (!end_of_subacls(acl, &end))
-            return report_corrupt(here(src_acl));
+        if ((rc = end_of_subacls(acl, &end)) != SEC_S_OK)
+            return rc;
         rc = splice(acl, end, 0, fresh, fresh_length, routine);
         if (rc == SEC_S_OK)
             set_subacl_count(acl, static_cast<std::uint16_t>(stored_subacl_count(acl) + 1));
