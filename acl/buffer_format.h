@@ -75,6 +75,11 @@ inline acl_bytes bytes_of(const sec_buffer_s &acl) {
             acl.length > 0 ? static_cast<std::size_t>(acl.length) : 0};
 }
 
+// The empty ACL: no bytes and no length, which listing and adding accept.
+inline bool is_empty_acl(const sec_buffer_s &acl) {
+    return acl.length == 0 && !acl.value;
+}
+
 // What a reader found of the header of a buffer.
 enum class header_state { ok, no_bytes, bad_type, bad_version, foreign_order };
 
