@@ -226,7 +226,10 @@ TEST(DumpSubacl, EntryLeadSpaceGrowsWithTheSubaclLeadSpace) {
     subacl_view v;
     ASSERT_TRUE(read_subacl(b, layout::header_size, &v));
     std::string lead(8, '\t');
-    output o = capture([&] { sec__dump_subacl(b, v, lead.c_str()); });
+    output o = capture([&] {
+        stream_sink sink(stderr, stdout);
+        sec__dump_subacl(b, v, lead.c_str(), sink);
+    });
     EXPECT_EQ(o.err, subacl_lines(lead, 29, 4, "unix", 1) + lead +
                          "\ttype = u; mech = unix; id = admin1; permission = rw\n");
 }
@@ -242,7 +245,10 @@ TEST(DumpSubacl, NoMemoryForTheLeadSpaceIsPrintedOnStandardOutput) {
     ASSERT_EQ(sec__subacl_to_acltree(b, v, &tree), SEC_S_OK);
     sec__free_acltree(tree);
     mem_fail_after(static_cast<long>(mem_allocations() - before));
-    output o = capture([&] { sec__dump_subacl(b, v, "\t"); });
+    output o = capture([&] {
+        stream_sink sink(stderr, stdout);
+        sec__dump_subacl(b, v, "\t", sink);
+    });
     mem_fail_after(-1);
     EXPECT_EQ(o.err, subacl_lines("\t", 29, 4, "unix", 1));
     EXPECT_EQ(o.out.rfind("2650-102", 0), 0u) << o.out;
