@@ -104,11 +104,9 @@ TEST(CommandLine, MistakesAreNamed) {
 }
 
 TEST(CommandLine, TypeNamesAndLetters) {
-    EXPECT_EQ(type_letter("unauthenticated"), 'n');
-    EXPECT_EQ(type_letter("G"), 'g');
-    EXPECT_EQ(type_letter("e"), 'e');
-    EXPECT_EQ(type_letter("users"), 0);
-    EXPECT_EQ(type_letter(""), 0);
+    for (const auto &[name, letter] :
+         {std::pair{"unauthenticated", 'n'}, {"G", 'g'}, {"e", 'e'}, {"users", '\0'}, {"", '\0'}})
+        EXPECT_EQ(type_letter(name), letter) << name;
 }
 
 TEST(TemplateFile, ParsesCommentsBlanksAndHelpText) {
