@@ -128,15 +128,18 @@ TEST(DumpAcl, StreamsOfTheCFunctions) {
     const recorded expected = dump(admin_acl(2));
     ASSERT_NE(expected.failures, "");
     kxtest::owned_acl acl(admin_acl(2));
-    sec__dump_acl_to(acl.get(), err.file, nullptr);
     unsigned char byte = 0x85;
     sec_buffer_desc none[] = {{0, nullptr}, {5, nullptr}, {0, &byte}, {-1, &byte}};
-    for (sec_buffer_desc &nothing : none)
-        sec__dump_acl_to(&nothing, err.file, err.file);
-    sec__dump_acl_to(nullptr, err.file, err.file);
+    // With the standard streams caught too, so that what a null stream
+    // does not drop shows.
     std::FILE *const saved_err = stderr, *const saved_out = stdout;
     stderr = err.file; // the C library's standard streams are variables
     stdout = out.file;
+    sec__dump_acl_to(acl.get(), err.file, nullptr);
+    sec__dump_acl_to(acl.get(), nullptr, nullptr);
+    for (sec_buffer_desc &nothing : none)
+        sec__dump_acl_to(&nothing, err.file, err.file);
+    sec__dump_acl_to(nullptr, err.file, err.file);
     sec__dump_acl(acl.get());
     stderr = saved_err;
     stdout = saved_out;
