@@ -39,6 +39,10 @@ struct expected_run {
     std::string out, err = "";
 };
 
+expected_run gives(strings args, int exit_code, std::string out, std::string err = "") {
+    return {std::move(args), exit_code, std::move(out), std::move(err)};
+}
+
 void expect_text(const std::string &actual, const std::string &expected) {
     if (expected.ends_with("..."))
         EXPECT_EQ(actual.substr(0, expected.size() - 3), expected.substr(0, expected.size() - 3));
@@ -82,20 +86,17 @@ TEST_F(KxaclTool, CompileWritesTheBufferAndTheCacheOrRefuses) {
     // 10 + 13 + 13; expanded 15 + 11.
     const std::string summary = acl + ": 7 entries in 5 sub-ACLs, 139 bytes\n";
     expect_runs({
-        {{"compile", acl, "--cache", "-o", out},
-         0,
-         summary + "cached in " + cacl + "\nwritten to " + out + "\n"},
-        {{"compile", acl, "--cache"}, 0, summary + cacl + " is current already\n"},
-        {{"--json", "compile", acl},
-         0,
-         R"({"file":")" + acl +
-             R"(","entries":7,"subacls":5,"bytes":139,"cached":false,"output":null,"note":null})"
-             "\n"},
-        {{"compile", acl, "-o", dir + "/x.cacl"},
-         2,
-         "",
-         "kxacl: refusing to write " + dir +
-             "/x.cacl: cached compiled files are written by the library only (use --cache)\n"},
+        gives({"compile", acl, "--cache", "-o", out}, 0,
+              summary + "cached in " + cacl + "\nwritten to " + out + "\n"),
+        gives({"compile", acl, "--cache"}, 0, summary + cacl + " is current already\n"),
+        gives(
+            {"--json", "compile", acl}, 0,
+            R"({"file":")" + acl +
+                R"(","entries":7,"subacls":5,"bytes":139,"cached":false,"output":null,"note":null})"
+                "\n"),
+        gives({"compile", acl, "-o", dir + "/x.cacl"}, 2, "",
+              "kxacl: refusing to write " + dir +
+                  "/x.cacl: cached compiled files are written by the library only (use --cache)\n"),
     });
     EXPECT_EQ(kxtest::read_file(cacl).size(), 139u);
     EXPECT_EQ(kxtest::read_file(out), kxtest::read_file(cacl));
@@ -103,11 +104,10 @@ TEST_F(KxaclTool, CompileWritesTheBufferAndTheCacheOrRefuses) {
 
     kxtest::write_file(acl, "n r\no r\nu unix\n");
     ASSERT_EQ(::unlink(cacl.c_str()), 0);
-    expect_runs({{{"compile", acl, "--cache"},
-                  2,
-                  "",
-                  "2650-172 Failure: An error occurred while parsing the\nACL file.  It appears "
-                  "that the ACLE at line 3 in the ACL file is missing\n..."}});
+    expect_runs(
+        {gives({"compile", acl, "--cache"}, 2, "",
+               "2650-172 Failure: An error occurred while parsing the\nACL file.  It appears "
+               "that the ACLE at line 3 in the ACL file is missing\n...")});
     const auto r = run_kxacl({"compile", acl, "--json"});
     EXPECT_EQ(parsed(r)["error"],
               json({{"kind", "library"}, {"status", 42}, {"id", "2650-172"}, {"message", r.err}}));
@@ -120,16 +120,14 @@ TEST_F(KxaclTool, CompileCacheSaysWhatBecameOfTheCachedFile) {
     kxtest::write_file(acl, "o rwx\n");
     kxtest::shift_mtime(acl, -20);
     expect_runs({
-        {{"compile", acl, "--cache"},
-         2,
-         "...",
-         "kxacl: " + cacl + " is newer than the text but holds another ACL (the text was " +
-             "replaced by an older-dated file): readers get the old entries (fix: kxacl " +
-             "compile " + acl + " --cache --force)\n"},
+        gives({"compile", acl, "--cache"}, 2, "...",
+              "kxacl: " + cacl + " is newer than the text but holds another ACL (the text was " +
+                  "replaced by an older-dated file): readers get the old entries (fix: kxacl " +
+                  "compile " + acl + " --cache --force)\n"),
         // The cached file, current by its date, answers in place of the text.
-        {{"check", acl, "--anyother"}, 0, "r 0x00000001\n"},
-        {{"compile", acl, "--cache", "--force"}, 0, "..."},
-        {{"check", acl, "--anyother"}, 0, "rwx 0x0000000b\n"},
+        gives({"check", acl, "--anyother"}, 0, "r 0x00000001\n"),
+        gives({"compile", acl, "--cache", "--force"}, 0, "..."),
+        gives({"check", acl, "--anyother"}, 0, "rwx 0x0000000b\n"),
     });
     // A cached file of another mode is never replaced.
     ASSERT_EQ(::chmod(cacl.c_str(), 0600), 0);
@@ -156,61 +154,59 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
     const std::string listing = "e unix  joe  w\ng admin rwcxCqledvsao\ng staff rw\n"
                                 "u unix  joe\nu unix  root rwcx\no r\nn\n";
     expect_runs({
-        {{"check", acl, "--user", "unix", "ROOT"}, 0, "rwcx 0x0000000f\n"},
-        {{"check", acl, "--user", "unix", "joe"}, 1, "- 0x00000000\n"},
-        {{"check", acl, "--user", "unix", "nobody"}, 1, none},
-        {{"check", acl, "--user", "krb5", "root"}, 1, none},
-        {{"check", acl, "--anyother"}, 0, "r 0x00000001\n"},
-        {{"check", acl, "--unauthenticated"}, 1, "- 0x00000000\n"},
-        {{"check", acl, "--group", "staff", "admin", "nobody"}, 0, "rwcxCqledvsao 0x00001fff\n"},
-        {{"check", buf, "--group", "staff"}, 0, "rw 0x00000003\n"},
-        {{"check", acl, "--expanded", "unix", "joe"}, 0, "w 0x00000002\n"},
-        {{"check", acl, "--expanded", "unix", "JOE"}, 1, none},
-        {{"check", acl, "--json", "--user", "unix", "joe"},
-         1,
-         R"({"entry":true,"granted":false,"perms":"","mask":0})"
-         "\n"},
-        {{"list", acl}, 0, listing},
-        {{"list", buf}, 0, listing},
-        {{"list", buf, "--type", "user", "--mech", "UNIX"}, 0, "u unix joe\nu unix root rwcx\n"},
-        {{"list", buf, "--type=g"}, 0, "g admin rwcxCqledvsao\ng staff rw\n"},
-        {{"list", acl, "--json", "--type", "e"},
-         0,
-         R"({"entries":[{"type":"expanded","mech":"unix","id":"joe","perms":"w","mask":2}]})"
-         "\n"},
-        {{"list", buf, "--json", "--type", "n"},
-         0,
-         R"({"entries":[{"type":"unauthenticated","mech":null,"id":null,"perms":"","mask":0}]})"
-         "\n"},
-        {{"explain", acl, "--user", "unix", "ROOT", "--group", "staff", "aaa", "--expanded", "unix",
-          "JOE"},
-         0,
-         "user unix ROOT: rwcx 0x0000000f\n  decided by line 5: u unix root rwcx\n"
-         "expanded unix JOE: no entry\n  no expanded entry of mechanism unix is JOE byte for byte "
-         "(1 compared by kxacl's stand-in for the mechanism's handler)\n"
-         "group staff: rw 0x00000003\n  decided by line 7: g staff rw\n"
-         "group aaa: no entry\n  no group entry names aaa: aaa sorts before admin (line 8), "
-         "where the walk stops\ngroups staff aaa: rw 0x00000003\n"
-         "anyother: r 0x00000001\n  decided by line 4: o r\n"
-         "unauthenticated: - 0x00000000\n  decided by line 3: n\n"},
+        gives({"check", acl, "--user", "unix", "ROOT"}, 0, "rwcx 0x0000000f\n"),
+        gives({"check", acl, "--user", "unix", "joe"}, 1, "- 0x00000000\n"),
+        gives({"check", acl, "--user", "unix", "nobody"}, 1, none),
+        gives({"check", acl, "--user", "krb5", "root"}, 1, none),
+        gives({"check", acl, "--anyother"}, 0, "r 0x00000001\n"),
+        gives({"check", acl, "--unauthenticated"}, 1, "- 0x00000000\n"),
+        gives({"check", acl, "--group", "staff", "admin", "nobody"}, 0,
+              "rwcxCqledvsao 0x00001fff\n"),
+        gives({"check", buf, "--group", "staff"}, 0, "rw 0x00000003\n"),
+        gives({"check", acl, "--expanded", "unix", "joe"}, 0, "w 0x00000002\n"),
+        gives({"check", acl, "--expanded", "unix", "JOE"}, 1, none),
+        gives({"check", acl, "--json", "--user", "unix", "joe"}, 1,
+              R"({"entry":true,"granted":false,"perms":"","mask":0})"
+              "\n"),
+        gives({"list", acl}, 0, listing),
+        gives({"list", buf}, 0, listing),
+        gives({"list", buf, "--type", "user", "--mech", "UNIX"}, 0,
+              "u unix joe\nu unix root rwcx\n"),
+        gives({"list", buf, "--type=g"}, 0, "g admin rwcxCqledvsao\ng staff rw\n"),
+        gives({"list", acl, "--json", "--type", "e"}, 0,
+              R"({"entries":[{"type":"expanded","mech":"unix","id":"joe","perms":"w","mask":2}]})"
+              "\n"),
+        gives(
+            {"list", buf, "--json", "--type", "n"}, 0,
+            R"({"entries":[{"type":"unauthenticated","mech":null,"id":null,"perms":"","mask":0}]})"
+            "\n"),
+        gives({"explain", acl, "--user", "unix", "ROOT", "--group", "staff", "aaa", "--expanded",
+               "unix", "JOE"},
+              0,
+              "user unix ROOT: rwcx 0x0000000f\n  decided by line 5: u unix root rwcx\n"
+              "expanded unix JOE: no entry\n  no expanded entry of mechanism unix is JOE byte for "
+              "byte "
+              "(1 compared by kxacl's stand-in for the mechanism's handler)\n"
+              "group staff: rw 0x00000003\n  decided by line 7: g staff rw\n"
+              "group aaa: no entry\n  no group entry names aaa: aaa sorts before admin (line 8), "
+              "where the walk stops\ngroups staff aaa: rw 0x00000003\n"
+              "anyother: r 0x00000001\n  decided by line 4: o r\n"
+              "unauthenticated: - 0x00000000\n  decided by line 3: n\n"),
         // A buffer file has positions instead of lines.
-        {{"explain", buf, "--user", "krb5", "root"},
-         0,
-         "user krb5 root: no entry\n  no user entry of mechanism krb5\n"
-         "anyother: r 0x00000001\n  decided by entry 6: o r\n"
-         "unauthenticated: - 0x00000000\n  decided by entry 7: n\n"},
-        {{"dump", acl},
-         0,
-         "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n\tByte Ordering: 2\n"
-         "\tNumber of sub-ACLs: 5\n\tSubacl:\n"
-         "\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)\n\n"
-         "\t\ttype = e; mech = unix; id = joe; permission = w\n..."},
-        {{"dump", buf, "--json"},
-         0,
-         R"({"lines":["ACL descriptor: 139 byte(s) long","\tVersion: 1",)"
-         R"("\tByte Ordering: 2","\tNumber of sub-ACLs: 5","\tSubacl:",)"
-         R"j("\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)","",)j"
-         R"("\t\ttype = e; mech = unix; id = joe; permission = w","\tSubacl:",...)"},
+        gives({"explain", buf, "--user", "krb5", "root"}, 0,
+              "user krb5 root: no entry\n  no user entry of mechanism krb5\n"
+              "anyother: r 0x00000001\n  decided by entry 6: o r\n"
+              "unauthenticated: - 0x00000000\n  decided by entry 7: n\n"),
+        gives({"dump", acl}, 0,
+              "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n\tByte Ordering: 2\n"
+              "\tNumber of sub-ACLs: 5\n\tSubacl:\n"
+              "\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)\n\n"
+              "\t\ttype = e; mech = unix; id = joe; permission = w\n..."),
+        gives({"dump", buf, "--json"}, 0,
+              R"({"lines":["ACL descriptor: 139 byte(s) long","\tVersion: 1",)"
+              R"("\tByte Ordering: 2","\tNumber of sub-ACLs: 5","\tSubacl:",)"
+              R"j("\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)","",)j"
+              R"("\t\ttype = e; mech = unix; id = joe; permission = w","\tSubacl:",...)"),
     });
     // Compiled again, the listing holds the same entries; sub-ACLs come out
     // in the other order, so listing twice gives back the first text.
@@ -338,8 +334,8 @@ TEST_F(KxaclTool, DiffShowsEachEntrysChangeAndGatesOnGrantingMore) {
     for (const auto &[old_text, new_text, out, grants_more] : cases) {
         kxtest::write_file(old_acl, old_text);
         kxtest::write_file(new_acl, new_text);
-        expect_runs({{{"diff", old_acl, new_acl}, 0, out},
-                     {{"diff", old_acl, new_acl, "--grants-more"}, grants_more, out}});
+        expect_runs({gives({"diff", old_acl, new_acl}, 0, out),
+                     gives({"diff", old_acl, new_acl, "--grants-more"}, grants_more, out)});
     }
     // A buffer file against a text, as JSON.
     kxtest::write_file(new_acl, "g admin rwcxCqledvsao\ng staff rwx\n");
@@ -374,7 +370,7 @@ TEST_F(KxaclTool, InstallNeverLeavesTheOldVersionTrusted) {
         // The file in place was compiled and cached long after it was written
         // (forced past a cached file that a replacement left in force).
         kxtest::shift_mtime(acl, -30);
-        expect_runs({{{"compile", acl, "--cache", "--force"}, 0, "..."}});
+        expect_runs({gives({"compile", acl, "--cache", "--force"}, 0, "...")});
         const std::int64_t before = daemon_read(acl);
         // The new text is older-dated than that cached file, as cp -p, rsync -t
         // and tar leave it.
@@ -387,7 +383,7 @@ TEST_F(KxaclTool, InstallNeverLeavesTheOldVersionTrusted) {
             EXPECT_EQ(daemon_read(acl), before);
             continue;
         }
-        expect_runs({{{"install", src, acl}, 0, "..."}});
+        expect_runs({gives({"install", src, acl}, 0, "...")});
         EXPECT_EQ(daemon_read(acl), (1 << version) - 1) << version;
     }
     done = true;
@@ -398,34 +394,28 @@ TEST_F(KxaclTool, InstallGivesOwnerAndModeAndRefusesWhatDoesNotCompile) {
     const std::string src = dir + "/src.acl", dest = dir + "/dest.acl";
     kxtest::write_file(src, "o rw\n");
     expect_runs({
-        {{"install", src, dest, "--mode", "0640", "--cache"},
-         0,
-         "installed " + src + " as " + dest + ": 1 entries, owner 0:0, mode 0640\ncached in " +
-             dest + ".cacl\n"},
+        gives({"install", src, dest, "--mode", "0640", "--cache"}, 0,
+              "installed " + src + " as " + dest + ": 1 entries, owner 0:0, mode 0640\ncached in " +
+                  dest + ".cacl\n"),
         // The cached file serves readers at once.
-        {{"explain", dest}, 0, "answered from " + dest + ".cacl..."},
-        {{"install", acl, dest, "--mode", "4755"},
-         2,
-         "",
-         "kxacl: --mode takes permission bits up to 0777, not 4755\n"},
-        {{"install", acl, dir}, 2, "", "kxacl: " + dir + " is not a regular file\n"},
-        {{"install", acl, dest + ".cacl"},
-         2,
-         "",
-         "kxacl: refusing to write " + dest +
-             ".cacl: cached compiled files are written by the library only (use --cache)\n"},
+        gives({"explain", dest}, 0, "answered from " + dest + ".cacl..."),
+        gives({"install", acl, dest, "--mode", "4755"}, 2, "",
+              "kxacl: --mode takes permission bits up to 0777, not 4755\n"),
+        gives({"install", acl, dir}, 2, "", "kxacl: " + dir + " is not a regular file\n"),
+        gives({"install", acl, dest + ".cacl"}, 2, "",
+              "kxacl: refusing to write " + dest +
+                  ".cacl: cached compiled files are written by the library only (use --cache)\n"),
     });
     EXPECT_EQ(kxtest::status_of(dest).st_mode & 07777, 0640u);
     // Owner and mode stay DEST's unless given.
     ASSERT_EQ(::chown(dest.c_str(), 65534, 65534), 0);
-    expect_runs({{{"install", src, dest, "--json"},
-                  0,
-                  R"({"source":")" + src + R"(","file":")" + dest +
-                      R"(","entries":1,"bytes":5,"uid":65534,"gid":65534,"mode":"0640",)"
-                      R"("cached":false})"
-                      "\n"}});
+    expect_runs({gives({"install", src, dest, "--json"}, 0,
+                       R"({"source":")" + src + R"(","file":")" + dest +
+                           R"(","entries":1,"bytes":5,"uid":65534,"gid":65534,"mode":"0640",)"
+                           R"("cached":false})"
+                           "\n")});
     kxtest::write_file(src, "o rw\ng\n");
-    expect_runs({{{"install", src, dest}, 2, "", "2650-172 Failure..."}});
+    expect_runs({gives({"install", src, dest}, 2, "", "2650-172 Failure...")});
     EXPECT_EQ(kxtest::read_file(dest), "o rw\n");
     EXPECT_EQ(files(), (strings{"dest.acl", "dest.acl.cacl", "res.acl", "src.acl"}));
 }
@@ -520,43 +510,39 @@ TEST_F(KxaclTool, LintFindsCacheStatesAndTheirFixes) {
 TEST_F(KxaclTool, LintIsSilentOnTheExampleFile) {
     kxtest::write_file(acl, kxtest::read_file(KXACL_EXAMPLE_ACL));
     kxtest::shift_mtime(acl, -10);
-    expect_runs({{{"lint", acl}, 0, ""}}); // without its cached file
+    expect_runs({gives({"lint", acl}, 0, "")}); // without its cached file
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    expect_runs({{{"lint", acl}, 0, ""}});
+    expect_runs({gives({"lint", acl}, 0, "")});
 }
 
 TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWholeOrRefuse) {
     compiled();
     ASSERT_EQ(::chmod(buf.c_str(), 0640), 0);
     expect_runs({
-        {{"add", buf, "--user", "unix", "ann@host1", "--perms", "rw"},
-         0,
-         "added: u unix ann@host1 rw\n"},
-        {{"check", buf, "--user", "unix", "ANN@host1"}, 0, "rw 0x00000003\n"},
+        gives({"add", buf, "--user", "unix", "ann@host1", "--perms", "rw"}, 0,
+              "added: u unix ann@host1 rw\n"),
+        gives({"check", buf, "--user", "unix", "ANN@host1"}, 0, "rw 0x00000003\n"),
         // Changing the mask of an existing entry, then refusing it with --new.
-        {{"add", buf, "--group", "staff", "--perms", "0x1"}, 0, "added: g staff r\n"},
+        gives({"add", buf, "--group", "staff", "--perms", "0x1"}, 0, "added: g staff r\n"),
     });
     const std::string before = kxtest::read_file(buf);
     expect_runs({
-        {{"add", buf, "--group", "staff", "--new", "--json"},
-         2,
-         R"({"error":{"kind":"library","status":...)",
-         "2650-175 ..."},
-        {{"add", buf, "--anyother", "--perms", "rz"}, 2, "", "2650-146 ..."},
-        {{"add", acl, "--anyother"},
-         2,
-         "",
-         "kxacl: " + acl + " is an ACL text file, not a compiled buffer file: compile it first " +
-             "with 'kxacl compile " + acl + " -o BUFFER' and use BUFFER\n"},
+        gives({"add", buf, "--group", "staff", "--new", "--json"}, 2,
+              R"({"error":{"kind":"library","status":...)", "2650-175 ..."),
+        gives({"add", buf, "--anyother", "--perms", "rz"}, 2, "", "2650-146 ..."),
+        gives({"add", acl, "--anyother"}, 2, "",
+              "kxacl: " + acl +
+                  " is an ACL text file, not a compiled buffer file: compile it first " +
+                  "with 'kxacl compile " + acl + " -o BUFFER' and use BUFFER\n"),
     });
     EXPECT_EQ(kxtest::read_file(buf), before);
     EXPECT_EQ(kxtest::read_file(acl), example_acl);
     expect_runs({
-        {{"del", buf, "--group", "staff", "--json"},
-         0,
-         R"({"deleted":{"type":"group","mech":null,"id":"staff","perms":"","mask":0},"file":")" +
-             buf + R"(","bytes":...)"},
-        {{"del", buf, "--group", "staff"}, 2, "", "2650-118 ..."},
+        gives(
+            {"del", buf, "--group", "staff", "--json"}, 0,
+            R"({"deleted":{"type":"group","mech":null,"id":"staff","perms":"","mask":0},"file":")" +
+                buf + R"(","bytes":...)"),
+        gives({"del", buf, "--group", "staff"}, 2, "", "2650-118 ..."),
     });
     EXPECT_EQ(kxtest::status_of(buf).st_mode & 07777, 0640u);
     EXPECT_EQ(files(), (strings{"res.acl", "res.buf"}));
@@ -566,14 +552,12 @@ TEST_F(KxaclTool, EditingNeverTouchesACachedFileInPlace) {
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
     const std::string before = kxtest::read_file(cacl);
     expect_runs({
-        {{"del", cacl, "--anyother"},
-         2,
-         "",
-         "kxacl: refusing to write " + cacl +
-             ": cached compiled files are written by the library only (use -o)\n"},
+        gives({"del", cacl, "--anyother"}, 2, "",
+              "kxacl: refusing to write " + cacl +
+                  ": cached compiled files are written by the library only (use -o)\n"),
         // Written elsewhere, the cached file stays as it was.
-        {{"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"},
-        {{"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"},
+        gives({"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"),
+        gives({"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"),
     });
     EXPECT_EQ(kxtest::read_file(cacl), before);
 }
@@ -587,18 +571,17 @@ TEST_F(KxaclTool, OnlyRegularFilesAreReadOrReplaced) {
         return "kxacl: " + file + " is not a regular file" + why + "\n";
     };
     expect_runs({
-        {{"list", "--buffer", fifo}, 2, "", refused(fifo)},
-        {{"list", fifo}, 2, "", refused(fifo)},
-        {{"list", acl, "--templates", fifo}, 2, "", refused(fifo)},
-        {{"check", "/dev/null", "--anyother"}, 2, "", refused("/dev/null")},
-        {{"compile", acl, "-o", fifo}, 2, "...", refused(fifo, ": it is not replaced")},
-        {{"compile", acl, "-o", dir}, 2, "...", refused(dir, ": it is not replaced")},
-        {{"--json", "check", dir, "--buffer", "--anyother"},
-         2,
-         R"({"error":{"kind":"tool","message":"kxacl: )" + dir +
-             R"( is not a regular file\n"}})"
-             "\n",
-         refused(dir)},
+        gives({"list", "--buffer", fifo}, 2, "", refused(fifo)),
+        gives({"list", fifo}, 2, "", refused(fifo)),
+        gives({"list", acl, "--templates", fifo}, 2, "", refused(fifo)),
+        gives({"check", "/dev/null", "--anyother"}, 2, "", refused("/dev/null")),
+        gives({"compile", acl, "-o", fifo}, 2, "...", refused(fifo, ": it is not replaced")),
+        gives({"compile", acl, "-o", dir}, 2, "...", refused(dir, ": it is not replaced")),
+        gives({"--json", "check", dir, "--buffer", "--anyother"}, 2,
+              R"({"error":{"kind":"tool","message":"kxacl: )" + dir +
+                  R"( is not a regular file\n"}})"
+                  "\n",
+              refused(dir)),
     });
 }
 
@@ -618,42 +601,36 @@ TEST_F(KxaclTool, EditingKeepsSetIdBitsOnlyOfTheRunningUsersFiles) {
 TEST_F(KxaclTool, PermsHelpAndUsageMistakes) {
     kxtest::write_file(dir + "/t", "1 4 one\n2 7 two\n");
     expect_runs({
-        {{"perms", "rwx"}, 0, "rwx 0x0000000b\n"},
-        {{"perms", "0xb"}, 0, "rwx 0x0000000b\n"},
-        {{"perms", "011"}, 0, "rwx 0x0000000b\n"}, // decimal, not octal
-        {{"perms", "--json", "C"}, 0, "{\"perms\":\"C\",\"mask\":16}\n"},
-        {{"perms", "--mask", "0xz"},
-         2,
-         "",
-         "kxacl: '0xz' is not a mask: write decimal digits, or 0x and hex digits\n"},
-        {{"perms", "0x2000"}, 2, "", "2650-178 ..."},
-        {{"perms", "0x100000000"}, 2, "", "kxacl: '0x100000000' is not a 32-bit mask\n"},
+        gives({"perms", "rwx"}, 0, "rwx 0x0000000b\n"),
+        gives({"perms", "0xb"}, 0, "rwx 0x0000000b\n"),
+        gives({"perms", "011"}, 0, "rwx 0x0000000b\n"), // decimal, not octal
+        gives({"perms", "--json", "C"}, 0, "{\"perms\":\"C\",\"mask\":16}\n"),
+        gives({"perms", "--mask", "0xz"}, 2, "",
+              "kxacl: '0xz' is not a mask: write decimal digits, or 0x and hex digits\n"),
+        gives({"perms", "0x2000"}, 2, "", "2650-178 ..."),
+        gives({"perms", "0x100000000"}, 2, "", "kxacl: '0x100000000' is not a 32-bit mask\n"),
         // Digits are permission characters when the templates say so.
-        {{"perms", "--string", "21", "--templates", dir + "/t"}, 0, "12 0x00000090\n"},
-        {{"perms", "--templates", dir + "/t"}, 0, "1 0x00000010  one\n2 0x00000080  two\n"},
-        {{"--help"}, 0, "Usage: kxacl [--json] COMMAND..."},
-        {{"--version"}, 0, "kxacl 1.0.0\n"},
-        {{"frobnicate"}, 2, "", "kxacl: unknown command 'frobnicate'\nTry 'kxacl --help'.\n"},
-        {{"check", acl, "--user", "unix"},
-         2,
-         "",
-         "kxacl: option --user needs a value\nTry 'kxacl check --help'.\n"},
-        {{"--json", "check", acl},
-         2,
-         R"({"error":{"kind":"usage","help":"kxacl check --help","message":"kxacl: check needs )"
-         R"(one of --unauthenticated, --anyother, --user, --expanded, --group\nTry 'kxacl )"
-         R"(check --help'.\n"}})"
-         "\n",
-         "kxacl: check needs one of --unauthenticated, --anyother, --user, --expanded, "
-         "--group\nTry 'kxacl check --help'.\n"},
-        {{"list", dir + "/missing.acl", "--json"},
-         2,
-         R"({"error":{"kind":"library","status":105,"id":"2650-135",...)",
-         "2650-135 ..."},
+        gives({"perms", "--string", "21", "--templates", dir + "/t"}, 0, "12 0x00000090\n"),
+        gives({"perms", "--templates", dir + "/t"}, 0, "1 0x00000010  one\n2 0x00000080  two\n"),
+        gives({"--help"}, 0, "Usage: kxacl [--json] COMMAND..."),
+        gives({"--version"}, 0, "kxacl 1.0.0\n"),
+        gives({"frobnicate"}, 2, "", "kxacl: unknown command 'frobnicate'\nTry 'kxacl --help'.\n"),
+        gives({"check", acl, "--user", "unix"}, 2, "",
+              "kxacl: option --user needs a value\nTry 'kxacl check --help'.\n"),
+        gives(
+            {"--json", "check", acl}, 2,
+            R"({"error":{"kind":"usage","help":"kxacl check --help","message":"kxacl: check needs )"
+            R"(one of --unauthenticated, --anyother, --user, --expanded, --group\nTry 'kxacl )"
+            R"(check --help'.\n"}})"
+            "\n",
+            "kxacl: check needs one of --unauthenticated, --anyother, --user, --expanded, "
+            "--group\nTry 'kxacl check --help'.\n"),
+        gives({"list", dir + "/missing.acl", "--json"}, 2,
+              R"({"error":{"kind":"library","status":105,"id":"2650-135",...)", "2650-135 ..."),
     });
     for (const std::string cmd : {"compile", "check", "explain", "lint", "diff", "install", "list",
                                   "add", "del", "dump", "perms"})
-        expect_runs({{{cmd, "--help"}, 0, "Usage: kxacl " + cmd + " ..."}});
+        expect_runs({gives({cmd, "--help"}, 0, "Usage: kxacl " + cmd + " ...")});
     // The default set has names too; each character is the library's own.
     const json listed = parsed(run_kxacl({"perms", "--json"}));
     ASSERT_EQ(listed["templates"].size(), 13u);
@@ -670,16 +647,14 @@ TEST_F(KxaclTool, CompileWithCustomTemplates) {
                                            "m 5 manage Change it\n");
     kxtest::write_file(acl, "u unix ann vm\no v\n");
     expect_runs({
-        {{"compile", acl, tmpl}, 0, "..."},
-        {{"list", acl, tmpl}, 0, "o v\nu unix ann vm\n"},
+        gives({"compile", acl, tmpl}, 0, "..."),
+        gives({"list", acl, tmpl}, 0, "o v\nu unix ann vm\n"),
         // Without the templates the default set has no 'm'.
-        {{"compile", acl}, 2, "", "2650-180 ..."},
+        gives({"compile", acl}, 2, "", "2650-180 ..."),
     });
     kxtest::write_file(dir + "/perms.txt", "v 0 view\nw 0 write\n");
-    expect_runs({{{"compile", acl, tmpl},
-                  2,
-                  "",
-                  "kxacl: " + dir + "/perms.txt: line 2: bit 0 is used twice\n"}});
+    expect_runs({gives({"compile", acl, tmpl}, 2, "",
+                       "kxacl: " + dir + "/perms.txt: line 2: bit 0 is used twice\n")});
 }
 
 } // namespace
