@@ -208,9 +208,12 @@ class memory_stream {
         std::free(data_);
     }
     std::FILE *get() { return file_; }
+    // What was written so far; a write that ran out of memory is a failure.
     std::string text() {
-        std::fflush(file_);
-        return std::string(data_, size_);
+        if (std::fflush(file_) != 0 || std::ferror(file_))
+            throw tool_error(std::string("cannot keep the dump in memory: ") +
+                             std::strerror(errno));
+        return data_ ? std::string(data_, size_) : std::string();
     }
 
   private:
