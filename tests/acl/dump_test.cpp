@@ -76,12 +76,14 @@ TEST(DumpAcl, LinesAndFailuresOfWholeBuffers) {
         {admin_acl(), descriptor(34, 1) + subacl("\t", 29, 4, "unix", 1) + "\t\t" + admin_line, ""},
         // The failure to show admins takes the place of its line.
         {build_acl({{SEC_ACLE_UNAUTHENTICATED, 0x0},
+                    {SEC_ACLE_ANYOTHER, 0x2},
                     {SEC_ACLE_EXPANDED, 0x10, "krb5", "x@y"},
                     {SEC_ACLE_GROUP, 0x103, "", "staff"},
                     {SEC_ACLE_GROUP, 0x2000, "", "admins"}}),
-         descriptor(85, 3) + subacl("\t", 37, 16, "", 2) + bad_mask +
+         descriptor(102, 4) + subacl("\t", 37, 16, "", 2) + bad_mask +
              "\t\ttype = g; id = staff; permission = rwd\n" + subacl("\t", 26, 8, "krb5", 1) +
-             "\t\ttype = e; mech = krb5; id = x@y; permission = C\n" + subacl("\t", 17, 1, "", 1) +
+             "\t\ttype = e; mech = krb5; id = x@y; permission = C\n" + subacl("\t", 17, 2, "", 1) +
+             "\t\ttype = o; permission = w\n" + subacl("\t", 17, 1, "", 1) +
              "\t\ttype = n; permission = \n",
          ""},
         {{0x85, 1, 2, 0, 0}, descriptor(5, 0), ""},
