@@ -23,6 +23,8 @@
 #ifndef KX_ACL_H
 #define KX_ACL_H
 
+#include <stdio.h>
+
 #include "kx.h"
 #include "kx_sec.h"
 
@@ -347,6 +349,14 @@ ACL_EXTERN kx_int32_t sec__group_acles_perm(sec_acl_buffer_t acl, kx_int32_t cou
  * line. Clears the thread's error record after every line. Returns nothing.
  */
 ACL_EXTERN void sec__dump_acl(sec_acl_buffer_t acl) KX_NOTHROW;
+
+/**
+ * Dumps acl as sec__dump_acl does, its lines to the stream lines and the
+ * failure that ends a dump of a damaged buffer to the stream failures
+ * instead; a NULL stream drops what would go to it. Flushes the stream after
+ * every piece, so that one reader of both sees them in order.
+ */
+ACL_EXTERN void sec__dump_acl_to(sec_acl_buffer_t acl, FILE *lines, FILE *failures) KX_NOTHROW;
 
 KX_END_DECL
 

@@ -11,9 +11,6 @@
 #include <string_view>
 #include <vector>
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <kx_acl.h>
 #include <kx_cu.h>
 
@@ -197,36 +194,41 @@ int run_edit(const invocation &inv) {
     return exit_ok;
 }
 
-// Runs the dump with its standard error going to a temporary file, and
-// gives back what it printed.
-std::string capture_dump(acl_buffer &acl) {
-    std::FILE *sink = std::tmpfile();
-    if (!sink)
-        throw tool_error(std::string("cannot create a temporary file: ") + std::strerror(errno));
-    std::fflush(stderr);
-    const int saved = ::dup(STDERR_FILENO);
-    if (saved < 0 || ::dup2(::fileno(sink), STDERR_FILENO) < 0) {
-        if (saved >= 0)
-            ::close(saved);
-        std::fclose(sink);
-        throw tool_error(std::string("cannot redirect standard error: ") + std::strerror(errno));
+// A stream whose bytes are kept in memory.
+class memory_stream {
+  public:
+    memory_stream() : file_(::open_memstream(&data_, &size_)) {
+        if (!file_)
+            throw tool_error(std::string("cannot open a memory stream: ") + std::strerror(errno));
     }
-    sec__dump_acl(acl.get());
-    std::fflush(stderr);
-    ::dup2(saved, STDERR_FILENO);
-    ::close(saved);
-    std::string text;
-    std::rewind(sink);
-    char chunk[4096];
-    for (std::size_t n; (n = std::fread(chunk, 1, sizeof chunk, sink)) > 0;)
-        text.append(chunk, n);
-    std::fclose(sink);
-    return text;
-}
+    memory_stream(const memory_stream &) = delete;
+    memory_stream &operator=(const memory_stream &) = delete;
+    ~memory_stream() {
+        std::fclose(file_);
+        std::free(data_);
+    }
+    std::FILE *get() { return file_; }
+    // What was written so far; a write that ran out of memory is a failure.
+    std::string text() {
+        if (std::fflush(file_) != 0 || std::ferror(file_))
+            throw tool_error(std::string("cannot keep the dump in memory: ") +
+                             std::strerror(errno));
+        return data_ ? std::string(data_, size_) : std::string();
+    }
+
+  private:
+    char *data_ = nullptr;
+    std::size_t size_ = 0;
+    std::FILE *file_;
+};
 
 int run_dump(const invocation &inv) {
     acl_input in(inv, SEC_F_ACL_CONVERT);
-    const std::string text = capture_dump(in.acl);
+    memory_stream lines, failures;
+    sec__dump_acl_to(in.acl.get(), lines.get(), failures.get());
+    // The buffer passed the library's validation, so a failure is not
+    // expected; were there one, it comes first, as it always has.
+    const std::string text = failures.text() + lines.text();
     if (!inv.json) {
         print(text);
         return exit_ok;

@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <tuple>
 
 #include "json.h"
 #include "options.h"
@@ -14,62 +15,58 @@ parsed parse(std::vector<const char *> args) {
     return parse_command_line(std::span<const char *const>(args.data(), args.size()));
 }
 
-TEST(CommandLine, GroupNamesRunToTheNextOption) {
-    const parsed p = parse({"check", "acl", "--group", "a", "b", "--json", "--group", "c"});
-    ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.cmd, command::check);
-    EXPECT_EQ(p.inv.input, "acl");
-    EXPECT_TRUE(p.inv.json);
-    EXPECT_EQ(p.inv.who.type, 'g');
-    EXPECT_EQ(p.inv.who.ids, (std::vector<std::string>{"a", "b", "c"}));
-    EXPECT_EQ(parse({"add", "buf", "--group", "a", "b"}).error, "--group takes one name here");
+// An identity as its type letter, mechanism and identities.
+std::string shown(const identity &who) {
+    std::string text = std::string(1, who.type ? who.type : '-') + "/" + who.mech;
+    for (const auto &id : who.ids)
+        text += "/" + id;
+    return text;
 }
 
-TEST(CommandLine, OwnerIsTheFileOwnerAndUserARequester) {
-    parsed p = parse({"compile", "f", "--owner", "bob", "--cache", "-o", "out"});
+// Group names run to the next option; owner is the file's owner and user a
+// requester; explain takes a whole requester, diff and install two files.
+TEST(CommandLine, OptionsFillTheInvocation) {
+    parsed p = parse({"check", "acl", "--group", "a", "b", "--json", "--group", "c"});
     ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.owner, "bob");
-    EXPECT_TRUE(p.inv.cache);
-    EXPECT_EQ(p.inv.output, "out");
-    EXPECT_EQ(p.inv.who.type, 0);
+    EXPECT_EQ(std::tie(p.inv.cmd, p.inv.input, p.inv.json),
+              std::tuple(command::check, "acl", true));
+    EXPECT_EQ(shown(p.inv.who), "g//a/b/c");
+    p = parse({"compile", "f", "--owner", "bob", "--cache", "-o", "out"});
+    ASSERT_EQ(p.error, "");
+    EXPECT_EQ(std::tie(p.inv.owner, p.inv.cache, p.inv.output), std::tuple("bob", true, "out"));
+    EXPECT_EQ(shown(p.inv.who), "-/");
     p = parse({"check", "f", "--user", "unix", "bob@h"});
     ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.who.type, 'u');
-    EXPECT_EQ(p.inv.who.mech, "unix");
-    EXPECT_EQ(p.inv.who.ids, std::vector<std::string>{"bob@h"});
-    EXPECT_EQ(parse({"check", "f", "--user=unix"}).error,
-              "option --user takes MECH ID as two arguments");
-    // explain takes a whole requester; diff and install two files.
+    EXPECT_EQ(shown(p.inv.who), "u/unix/bob@h");
     p = parse({"explain", "f", "--group", "a", "--user", "unix", "u@h", "--group", "b",
                "--expanded", "unix", "x"});
     ASSERT_EQ(p.error, "");
     ASSERT_EQ(p.inv.asks.size(), 3u);
-    EXPECT_EQ(p.inv.asks[0].ids, (std::vector<std::string>{"a", "b"}));
-    EXPECT_EQ(p.inv.asks[2].type, 'e');
+    EXPECT_EQ(shown(p.inv.asks[0]) + " " + shown(p.inv.asks[1]) + " " + shown(p.inv.asks[2]),
+              "g//a/b u/unix/u@h e/unix/x");
     p = parse({"install", "src", "dest", "--owner", "root", "--mode", "0640", "--cache"});
     ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.input + " " + p.inv.second + " " + p.inv.mode, "src dest 0640");
+    EXPECT_EQ(std::tie(p.inv.input, p.inv.second, p.inv.owner, p.inv.mode, p.inv.cache),
+              std::tuple("src", "dest", "root", "0640", true));
     p = parse({"lint", "f", "--mech", "sso", "--mech=ldap", "--read-like", "r"});
     EXPECT_EQ(p.inv.known_mechs, (std::vector<std::string>{"sso", "ldap"}));
     EXPECT_EQ(p.inv.read_like, "r");
-}
-
-TEST(CommandLine, ValuesInlineOrSeparateAndDashDash) {
-    parsed p = parse({"--json", "list", "--type=user", "--mech", "unix", "--", "-odd-name"});
+    // Values inline or separate, and -- before a name that starts with -.
+    p = parse({"--json", "list", "--type=user", "--mech", "unix", "--", "-odd-name"});
     ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.list_type, 'u');
-    EXPECT_EQ(p.inv.list_mech, "unix");
-    EXPECT_EQ(p.inv.input, "-odd-name");
+    EXPECT_EQ(std::tie(p.inv.list_type, p.inv.list_mech, p.inv.input),
+              std::tuple('u', "unix", "-odd-name"));
     p = parse({"perms", "--string", "--templates=t", "--", "-r"});
     ASSERT_EQ(p.error, "");
-    EXPECT_EQ(p.inv.perms_arg, "-r");
-    EXPECT_EQ(p.inv.perms_as, perms_mode::string);
-    EXPECT_EQ(p.inv.templates, "t");
+    EXPECT_EQ(std::tie(p.inv.perms_arg, p.inv.perms_as, p.inv.templates),
+              std::tuple("-r", perms_mode::string, "t"));
 }
 
 TEST(CommandLine, MistakesAreNamed) {
     const std::pair<std::vector<const char *>, const char *> cases[] = {
         {{}, "no command given"},
+        {{"add", "buf", "--group", "a", "b"}, "--group takes one name here"},
+        {{"check", "f", "--user=unix"}, "option --user takes MECH ID as two arguments"},
         {{"list"}, "list needs a file"},
         {{"list", "a", "b"}, "unexpected argument 'b'"},
         {{"list", "a", "--cache"}, "unknown option --cache for list"},
@@ -104,11 +101,9 @@ TEST(CommandLine, MistakesAreNamed) {
 }
 
 TEST(CommandLine, TypeNamesAndLetters) {
-    EXPECT_EQ(type_letter("unauthenticated"), 'n');
-    EXPECT_EQ(type_letter("G"), 'g');
-    EXPECT_EQ(type_letter("e"), 'e');
-    EXPECT_EQ(type_letter("users"), 0);
-    EXPECT_EQ(type_letter(""), 0);
+    for (const auto &[name, letter] :
+         {std::pair{"unauthenticated", 'n'}, {"G", 'g'}, {"e", 'e'}, {"users", '\0'}, {"", '\0'}})
+        EXPECT_EQ(type_letter(name), letter) << name;
 }
 
 TEST(TemplateFile, ParsesCommentsBlanksAndHelpText) {
