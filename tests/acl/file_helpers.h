@@ -12,6 +12,7 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <variant>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -78,6 +79,21 @@ inline std::vector<std::string> dir_entries(const std::string &dir) {
     }
     std::sort(names.begin(), names.end());
     return names;
+}
+
+// "acl." and four lowercase hex digits: a temporary name of the CACL writer.
+inline bool is_temp_name(const std::string &name) {
+    return name.size() == 8 && name.compare(0, 4, "acl.") == 0 &&
+           name.find_first_not_of("0123456789abcdef", 4) == std::string::npos;
+}
+
+// Message arguments in which a text starting with "$" stands for dir
+// followed by the rest of the text.
+inline std::vector<arg> in_dir(const std::string &dir, std::vector<arg> args) {
+    for (arg &a : args)
+        if (auto *s = std::get_if<std::string>(&a); s && !s->empty() && (*s)[0] == '$')
+            *s = dir + s->substr(1);
+    return args;
 }
 
 // Removes a directory and the files (not subdirectories) in it.
