@@ -49,67 +49,27 @@ TEST(ReadAclFileNames, PathsBuiltFromTheWorkingDirectoryOrTheHome) {
     const std::string fits(1095, 'n'), longest = "/" + std::string(4096, 'a');
     const std::string home = getpwnam("root")->pw_dir, in_home(4095 - home.size(), 'n');
     const char *nobody = "kx-no-such-user";
+    // clang-format off
     std::vector<name_case> cases = {
-        {"relative",
-         dir,
-         "none",
-         nullptr,
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_135,
-         {dir + "/none", ENOENT}},
-        {"relative in /",
-         "/",
-         "kx-none-acl",
-         nullptr,
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_135,
+        {"relative", dir, "none", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135, {dir + "/none", ENOENT}},
+        {"relative in /", "/", "kx-none-acl", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
          {"/kx-none-acl", ENOENT}},
-        {"directory and name of 4096",
-         deep,
-         fits,
-         nullptr,
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_135,
+        {"directory and name of 4096", deep, fits, nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
          {deep + "/" + fits, ENAMETOOLONG}},
-        {"directory and name of 4097",
-         deep,
-         fits + "n",
-         nullptr,
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_167,
+        {"directory and name of 4097", deep, fits + "n", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_167,
          {deep, fits + "n"}},
-        {"full path of 4097",
-         "/",
-         longest,
-         nullptr,
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_135,
+        {"full path of 4097", "/", longest, nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
          {longest, ENAMETOOLONG}},
         {"unknown user", "/", "acl", nobody, SEC_S_USER_NOT_FOUND, MSG_2650_140, {nobody}},
-        {"path in the name",
-         "/",
-         "dir/acl",
-         nobody,
-         SEC_S_BAD_PARAM,
-         MSG_2650_165,
-         {"dir/acl", nobody}},
+        {"path in the name", "/", "dir/acl", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"dir/acl", nobody}},
         {"full path", "/", "/tmp/acl", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"/tmp/acl", nobody}},
         {"trailing slash", "/", "acl/", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"acl/", nobody}},
-        {"home and name of 4096",
-         "/",
-         in_home,
-         "root",
-         SEC_S_NO_ACL_FILE,
-         MSG_2650_135,
+        {"home and name of 4096", "/", in_home, "root", SEC_S_NO_ACL_FILE, MSG_2650_135,
          {home + "/" + in_home, ENAMETOOLONG}},
-        {"home and name of 4097",
-         "/",
-         in_home + "n",
-         "root",
-         SEC_S_BAD_PARAM,
-         MSG_2650_165,
+        {"home and name of 4097", "/", in_home + "n", "root", SEC_S_BAD_PARAM, MSG_2650_165,
          {in_home + "n", "root"}},
     };
+    // clang-format on
     for (const auto &c : cases)
         expect_resolved(c);
 }
@@ -162,40 +122,22 @@ TEST(ReadWholeAclFile, BufferOrReport) {
         int msg;
         std::vector<arg> args;
     } cases[] = {
+        // clang-format off
         {"empty", path, "", {}, SEC_S_OK, 0, {}},
         {"bytes", path, "o r\ng st r", {}, SEC_S_OK, 0, {}},
-        {"replaced after opening",
-         path,
-         "o r\n",
-         [&](int) {
+        {"replaced after opening", path, "o r\n", [&](int) {
              write_file(dir + "/new", "o rw\ng staff r\n");
              ASSERT_EQ(rename((dir + "/new").c_str(), path.c_str()), 0);
-         },
-         SEC_S_FILE_ERROR,
-         MSG_2650_139,
-         {0, 15, 0}},
-        {"short count, not retried",
-         path,
-         "0123456789",
-         [](int fd) { ASSERT_EQ(lseek(fd, 4, SEEK_SET), 4); },
-         SEC_S_FILE_ERROR,
-         MSG_2650_139,
-         {6, 10, 0}},
+         }, SEC_S_FILE_ERROR, MSG_2650_139, {0, 15, 0}},
+        {"short count, not retried", path, "0123456789", [](int fd) {
+             ASSERT_EQ(lseek(fd, 4, SEEK_SET), 4);
+         }, SEC_S_FILE_ERROR, MSG_2650_139, {6, 10, 0}},
         {"a read error", subdir, "", {}, SEC_S_FILE_ERROR, MSG_2650_139, {-1, subdir_size, EISDIR}},
-        {"name without file",
-         path,
-         "o r\n",
-         [&](int) { ASSERT_EQ(unlink(path.c_str()), 0); },
-         SEC_S_FILE_ERROR,
-         MSG_2650_135,
-         {path, ENOENT}},
-        {"no memory",
-         path,
-         "0123456789",
-         [](int) { mem_fail_after(0); },
-         SEC_S_NO_MEMORY,
-         MSG_2650_102,
-         {"sec_read_acl_file", 11}},
+        {"name without file", path, "o r\n", [&](int) { ASSERT_EQ(unlink(path.c_str()), 0); },
+         SEC_S_FILE_ERROR, MSG_2650_135, {path, ENOENT}},
+        {"no memory", path, "0123456789", [](int) { mem_fail_after(0); }, SEC_S_NO_MEMORY,
+         MSG_2650_102, {"sec_read_acl_file", 11}},
+        // clang-format on
     };
     std::vector<std::string> short_reads, expected_short_reads;
     for (const auto &c : cases) {
