@@ -7,10 +7,8 @@
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
-#include <grp.h>
 #include <string>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <variant>
 #include <vector>
@@ -189,22 +187,6 @@ class scoped_user {
     std::string name_;
     bool ok_ = false;
 };
-
-// Runs check() in a child process that has given up root for uid and gid,
-// and gives back check()'s result (the exit code), 200 when the child did not
-// exit normally, 100 when it could not change its user.
-template <typename Check> int exit_code_as_user(uid_t uid, gid_t gid, Check check) {
-    pid_t pid = fork();
-    if (pid == 0) {
-        if (setgroups(0, nullptr) != 0 || setgid(gid) != 0 || setuid(uid) != 0)
-            _exit(100);
-        _exit(check());
-    }
-    int status = 0;
-    if (pid < 0 || waitpid(pid, &status, 0) != pid || !WIFEXITED(status))
-        return 200;
-    return WEXITSTATUS(status);
-}
 
 #define KXTEST_REQUIRE_ROOT()                                                                      \
     do {                                                                                           \
