@@ -257,22 +257,25 @@ TEST(ReadAclFile, NoMemoryForTheUserLookup) {
 
 // ---- trace points ----------------------------------------------------------
 
-// An empty file, a compile that caches, a cached read and a read beside a
-// CACL file of another mode, one after the other.
+// An empty file, a compile that caches, a cached read, and reads beside a
+// CACL file of another mode and beside a symbolic link (judged by its own
+// status), one after the other.
 TEST(ReadAclFileTrace, InfoPoints) {
     std::string trace = start_tracing("_SEL:Info=1");
-    acl_dir empty(""), d, foreign;
+    acl_dir empty(""), d, foreign, linked;
     write_file(empty.cacl, example_acl());
     write_file(foreign.cacl, "x", 0600);
+    ASSERT_EQ(symlink("/dev/null", linked.cacl.c_str()), 0);
     ASSERT_EQ(acl_read(empty.acl, CACHE).status, SEC_S_OK);
     ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
     ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
     ASSERT_EQ(acl_read(foreign.acl, 0).status, SEC_S_OK);
+    ASSERT_EQ(acl_read(linked.acl, 0).status, SEC_S_OK);
     auto records = read_trace(trace);
     // 116 empty; 117 examine, 118 absent, 121 open the text, 110 cache
-    // absent; 117 examine, 121 open the CACL file; 117, 120 foreign, 121.
-    ASSERT_EQ(trace_ids(trace),
-              (std::vector<unsigned>{116, 117, 118, 121, 110, 117, 121, 117, 120, 121}));
+    // absent; 117 examine, 121 open the CACL file; twice 117, 120 foreign, 121.
+    ASSERT_EQ(trace_ids(trace), (std::vector<unsigned>{116, 117, 118, 121, 110, 117, 121, 117, 120,
+                                                       121, 117, 120, 121}));
     EXPECT_EQ(records[0].items, (items{hex_text(empty.acl)}));
     EXPECT_EQ(records[1].items, (items{hex_text(d.cacl)}));
     EXPECT_EQ(records[2].items, (items{hex_text(d.cacl), hex_of(ENOENT)}));
@@ -282,6 +285,7 @@ TEST(ReadAclFileTrace, InfoPoints) {
     EXPECT_EQ(records[8].items[0], hex_text(foreign.acl));
     EXPECT_EQ(records[8].items[5], hex_of(kx_uint32_t{S_IFREG | 0644}));
     EXPECT_EQ(records[8].items[6], hex_of(kx_uint32_t{S_IFREG | 0600}));
+    EXPECT_EQ(records[11].items[6], hex_of(kx_uint32_t{S_IFLNK | 0777}));
 }
 
 // At Info 8 every consumed line is traced with its number, type,
