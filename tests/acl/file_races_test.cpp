@@ -139,6 +139,19 @@ void run_swap(void *arg) {
     (*static_cast<std::function<void()> *>(arg))();
 }
 
+// A text cut short between two reads of the window: the report shows what
+// the reads got in all.
+TEST(ReadAclFileRaces, TextCutShortBetweenReads) {
+    acl_dir d(padding(70000));
+    std::function<void()> cut = [&] { ASSERT_EQ(truncate(d.acl.c_str(), 0), 0); };
+    sys_before_nth(sys_call::read, 1, run_swap, &cut);
+    acl_read r(d.acl, TEXT);
+    EXPECT_TRUE(sys_fault_fired());
+    EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
+    EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_139, {65536, 70000, 0}));
+    EXPECT_TRUE(r.empty());
+}
+
 // Two ACL files of different owners and modes, "mine", root's, and
 // "theirs", daemon's (uid and gid 1); the reader reads the name "acl",
 // which starts as another name of "mine".
