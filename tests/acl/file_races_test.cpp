@@ -271,31 +271,6 @@ TEST(ReadAclFileRaces, NameGivenToAnotherFileBetweenTheReadersSteps) {
     }
 }
 
-// With a user name, the file opened must be the user's, empty or not.
-TEST(ReadAclFileRaces, AnotherUsersFileSwappedInIsRefusedEvenEmpty) {
-    KXTEST_REQUIRE_ROOT();
-    std::string home = temp_dir();
-    scoped_user user(home);
-    if (!user.ok())
-        GTEST_SKIP() << "SKIPPED: useradd failed";
-    const passwd *pw = getpwnam(user.name().c_str());
-    ASSERT_NE(pw, nullptr);
-    for (const char *theirs : {"o rwcx\n", ""}) {
-        SCOPED_TRACE(std::string("root's file: \"") + theirs + "\"");
-        write_file(home + "/acl", "o r\n");
-        ASSERT_EQ(chown((home + "/acl").c_str(), pw->pw_uid, pw->pw_gid), 0);
-        write_file(home + "/root", theirs);
-        std::function<void()> swap = [&] {
-            ASSERT_EQ(rename((home + "/root").c_str(), (home + "/acl").c_str()), 0);
-        };
-        sys_before_nth(sys_call::open, 0, run_swap, &swap); // TEXT: the text's open
-        acl_read r("acl", TEXT, user.name().c_str());
-        EXPECT_TRUE(sys_fault_fired());
-        EXPECT_EQ(r.status, SEC_S_BAD_PERMISSION);
-        EXPECT_EQ(last_error().msg_num, MSG_2650_141);
-    }
-}
-
 // A daemon without a controlling terminal opens a terminal swapped in for
 // its ACL file without acquiring it, and refuses it.
 TEST(ReadAclFileRaces, TerminalSwappedInIsNeitherAcquiredNorRead) {

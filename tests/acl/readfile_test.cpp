@@ -17,6 +17,7 @@
 #include "file_helpers.h"
 #include "messages.h"
 #include "support.h"
+#include "syscalls.h"
 
 using namespace kxacl;
 using namespace kxtest;
@@ -176,8 +177,16 @@ TEST(ReadAclFile, LongestCachedPathIsReused) {
     }
 }
 
+// Gives the name "acl" in the directory at dir to the file "staged" there;
+// the hook of sys_before_nth.
+void swap_in(void *dir) {
+    const std::string &d = *static_cast<const std::string *>(dir);
+    ASSERT_EQ(rename((d + "/staged").c_str(), (d + "/acl").c_str()), 0);
+}
+
 // With a user name the file must be the user's and writable by nobody
-// else, unless it is empty.
+// else, unless it is empty; the file opened must be the user's, empty or
+// not, when root's is swapped in just before the opening.
 TEST(ReadAclFile, UsersFileRules) {
     KXTEST_REQUIRE_ROOT();
     std::string home = temp_dir();
@@ -193,22 +202,31 @@ TEST(ReadAclFile, UsersFileRules) {
         kx_uint32_t flags;
         kx_int32_t status;
         kx_uint32_t rflags;
+        const char *swapped_in = nullptr;
     } cases[] = {
         {"root's", example_text, false, 0644, CACHE, SEC_S_BAD_PERMISSION, CACHE},
         {"the user's", example_text, true, 0644, 0, SEC_S_OK, TEXT},
         {"group-writable", example_text, true, 0664, 0, SEC_S_BAD_PERMISSION, 0},
         {"writable by others", example_text, true, 0646, 0, SEC_S_BAD_PERMISSION, 0},
         {"empty, root's, writable by all", "", false, 0666, CACHE, SEC_S_OK, CACHE},
+        {"root's swapped in", example_text, true, 0644, TEXT, SEC_S_BAD_PERMISSION, TEXT, "o r\n"},
+        {"root's empty file swapped in", example_text, true, 0644, TEXT, SEC_S_BAD_PERMISSION, TEXT,
+         ""},
     };
+    const std::string staged = home + "/staged", acl = home + "/acl";
     for (const auto &c : cases) {
         SCOPED_TRACE(c.what);
-        write_file(home + "/acl", c.text, c.mode);
-        ASSERT_EQ(chown((home + "/acl").c_str(), c.users ? uid : 0, static_cast<gid_t>(-1)), 0);
+        write_file(acl, c.text, c.mode);
+        ASSERT_EQ(chown(acl.c_str(), c.users ? uid : 0, static_cast<gid_t>(-1)), 0);
+        if (c.swapped_in) {
+            write_file(staged, c.swapped_in);
+            sys_before_nth(sys_call::open, 0, swap_in, &home);
+        }
         acl_read r("acl", c.flags, user.name().c_str());
+        EXPECT_EQ(sys_fault_fired(), c.swapped_in != nullptr);
         EXPECT_EQ(r.status, c.status);
-        EXPECT_TRUE(c.status == SEC_S_OK
-                        ? record_is(SEC_S_OK, 0, {})
-                        : record_is(c.status, MSG_2650_141, {home + "/acl", user.name()}));
+        EXPECT_TRUE(c.status == SEC_S_OK ? record_is(SEC_S_OK, 0, {})
+                                         : record_is(c.status, MSG_2650_141, {acl, user.name()}));
         EXPECT_EQ(r.bytes(), *c.text && c.status == SEC_S_OK ? example_acl() : "");
         EXPECT_EQ(r.rflags, c.rflags);
     }
