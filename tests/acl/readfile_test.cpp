@@ -336,6 +336,7 @@ TEST(ReadAclFileTrace, PerfPointsOfACompile) {
     EXPECT_EQ(records[2].items.size(), 4u);
     ASSERT_EQ(records[3].items.size(), 5u);
     EXPECT_EQ(records[3].items[1], hex_of(4));
+    EXPECT_EQ(records[5].items.size(), 3u);
 }
 
 } // namespace
