@@ -163,7 +163,9 @@ void fail_each_call_of_read(const std::string &path, cacl_before cacl, kx_uint32
             ADD_FAILURE() << "chdir " << p.d.dir;
         std::string bytes = "<unread>";
         kx_uint32_t rflags = 0;
-        bool fired = with_failure(kind, n, injected, expected, p.d.dir, [&] {
+        // A relative name joins the working directory as getcwd gives it.
+        std::string dir = relative ? std::filesystem::canonical(p.d.dir).string() : p.d.dir;
+        bool fired = with_failure(kind, n, injected, expected, dir, [&] {
             acl_read r(relative ? "acl" : p.d.acl, flags);
             bytes = r.bytes();
             rflags = r.rflags;
