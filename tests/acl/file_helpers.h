@@ -7,11 +7,10 @@
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
-#include <grp.h>
 #include <string>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
+#include <variant>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -78,6 +77,21 @@ inline std::vector<std::string> dir_entries(const std::string &dir) {
     }
     std::sort(names.begin(), names.end());
     return names;
+}
+
+// "acl." and four lowercase hex digits: a temporary name of the CACL writer.
+inline bool is_temp_name(const std::string &name) {
+    return name.size() == 8 && name.compare(0, 4, "acl.") == 0 &&
+           name.find_first_not_of("0123456789abcdef", 4) == std::string::npos;
+}
+
+// Message arguments in which a text starting with "$" stands for dir
+// followed by the rest of the text.
+inline std::vector<arg> in_dir(const std::string &dir, std::vector<arg> args) {
+    for (arg &a : args)
+        if (auto *s = std::get_if<std::string>(&a); s && !s->empty() && (*s)[0] == '$')
+            *s = dir + s->substr(1);
+    return args;
 }
 
 // Removes a directory and the files (not subdirectories) in it.
@@ -173,22 +187,6 @@ class scoped_user {
     std::string name_;
     bool ok_ = false;
 };
-
-// Runs check() in a child process that has given up root for uid and gid,
-// and gives back check()'s result (the exit code), 200 when the child did not
-// exit normally, 100 when it could not change its user.
-template <typename Check> int exit_code_as_user(uid_t uid, gid_t gid, Check check) {
-    pid_t pid = fork();
-    if (pid == 0) {
-        if (setgroups(0, nullptr) != 0 || setgid(gid) != 0 || setuid(uid) != 0)
-            _exit(100);
-        _exit(check());
-    }
-    int status = 0;
-    if (pid < 0 || waitpid(pid, &status, 0) != pid || !WIFEXITED(status))
-        return 200;
-    return WEXITSTATUS(status);
-}
 
 #define KXTEST_REQUIRE_ROOT()                                                                      \
     do {                                                                                           \
