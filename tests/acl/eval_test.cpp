@@ -119,6 +119,9 @@ std::vector<request> requests() {
     header_counts_more[3] = 2;               // a sub-ACL that is not there
     const bytes one_other = make_acl({make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
     const bytes other_cut = prefix(one_other, one_other.size() - 1);
+    bytes too_short = make_acl({make_subacl(2, 0, {}, {})}); // leads on to no other
+    store_u32(&too_short[5], 0);
+    store_u16(&too_short[3], 0xffff);
     const int ok = SEC_S_OK, no = SEC_S_BAD_ACLE, bad = SEC_S_BAD_ACL, none = 0;
     const int found = MSG_2650_147, corrupt = MSG_2650_110;
 
@@ -206,6 +209,8 @@ std::vector<request> requests() {
         {"sub-ACL counted, absent", header_counts_more, 2, nullptr, nullptr, nullptr, {}, bad, 0,
          corrupt, {}},
         {"anyother entry cut", other_cut, 2, nullptr, nullptr, nullptr, {}, bad, 0, corrupt, {}},
+        {"sub-ACL shorter than its header", too_short, 1, nullptr, nullptr, nullptr, {}, bad, 0,
+         corrupt, {}},
     };
     // clang-format on
 }
