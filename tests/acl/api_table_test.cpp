@@ -379,15 +379,33 @@ struct expected {
     }
 };
 
+// Trace items: numbers of 1 and 4 bytes, pointers, texts.
+std::string u8(std::uint8_t v) {
+    return hex_of(v);
+}
+std::string u32(kx_uint32_t v) {
+    return hex_of(v);
+}
+std::string i32(kx_int32_t v) {
+    return hex_of(v);
+}
+std::string ptr(const void *p) {
+    return hex_of(p);
+}
+std::string txt(const std::string &s) {
+    return hex_text(s);
+}
+
 // What the traced calls share; made before the first library call.
 struct world {
-    owned_acl acl, from_file;
+    owned_acl acl, from_file, empty;
     sec_acle_t acle = nullptr;
     owned_list list, typed;
     entry carol{SEC_ACLE_USER, 7, "unix", "carol"};
     acl_dir dir{"o r\n# c\ng staff rw\n"};
     kx_uint32_t perm = 0, rflags = 0;
-    char text[33] = {};
+    char text[33] = {}, unix_mech[5] = "unix", staff[6] = "staff";
+    sec_buffer_s groups[1] = {{6, staff}};
     char *mech = nullptr, *id = nullptr;
     ~world() {
         std::free(mech);
@@ -399,221 +417,132 @@ kx_int32_t handler(char *, char *) {
     return 0;
 }
 
-template <typename T> std::string hex(T v) {
-    return hex_of(v);
+// The entry items of the edits: carol's entry, then the ACL's descriptor.
+std::vector<std::string> edit_items(world &w) {
+    return {ptr(w.carol.p()),
+            u32(4),
+            u32(7),
+            txt("unix"),
+            txt("carol"),
+            ptr(w.acl.get()),
+            i32(w.acl.d.length),
+            ptr(w.acl.d.value)};
 }
 
 // One call: the bare ids it records at API level 1 (none: 0), whether it
 // clears the error record on entry, whether it is a release (whose exit is
 // recorded at every level but 0); run makes it and states its level-8 records.
+enum call_kind { keeps = 0, clears = 1, release = 2 };
 struct traced_call {
     const char *call;
     unsigned enter, exit;
-    bool clears, release;
+    int kind;
     std::function<kx_int32_t(world &, expected &)> run;
 };
 
-const kx_int32_t ok = SEC_S_OK;
-const sec_perm_set_t no_set = nullptr;
-const void *const null = nullptr;
+constexpr kx_int32_t ok = SEC_S_OK;
 
 std::vector<traced_call> traced_calls() {
+    // clang-format off
     return {
-        {"sec_translate_perms failing", 91, 94, false, false,
-         [](world &w, expected &x) {
-             x.at(93, {hex_text("rz"), hex(no_set), hex(&w.perm)});
-             x.at(95, {hex(kx_int32_t{SEC_S_BAD_PERMISSION})});
-             return sec_translate_perms("rz", nullptr, &w.perm);
-         }},
-        {"sec_translate_perms of no text", 91, 94, false, false,
-         [](world &w, expected &x) {
-             x.at(93, {hex_text("<nil>"), hex(no_set), hex(&w.perm)});
-             x.at(96, {hex(ok), hex(kx_uint32_t{0})});
-             return sec_translate_perms(nullptr, nullptr, &w.perm);
-         }},
-        {"sec_translate_bitmask", 97, 100, false, false,
-         [](world &w, expected &x) {
-             x.at(99, {hex(kx_uint32_t{3}), hex(no_set), hex(&w.text[0])});
-             x.at(102, {hex(ok), hex_text("rw")});
-             return sec_translate_bitmask(3, nullptr, w.text);
-         }},
-        {"sec_create_acle", 40, 43, true, false,
-         [](world &w, expected &x) {
-             x.at(42, {hex(kx_uint32_t{4}), hex(kx_uint32_t{3}), hex_text("unix"),
-                       hex_text("bob@host"), hex(&w.acle)});
-             x.at(44, {hex(ok)});
-             return sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@host", &w.acle);
-         }},
-        {"sec_display_acle_id", 49, 52, true, false,
-         [](world &w, expected &x) {
-             x.at(51, {hex(w.acle), hex(kx_uint32_t{4}), hex(kx_uint32_t{3}), hex_text("unix"),
-                       hex_text("bob@host"), hex(&w.mech), hex(&w.id)});
-             x.at(54, {hex(ok), hex_text("unix"), hex_text("bob@host")});
-             return sec_display_acle_id(w.acle, &w.mech, &w.id);
-         }},
-        {"sec_release_acle", 45, 48, false, true,
-         [](world &w, expected &x) {
-             x.at(47, {hex(w.acle), hex(std::uint8_t{4}), hex(kx_uint32_t{3}), hex_text("unix"),
-                       hex_text("bob@host")});
-             x.at(48);
+        {"sec_translate_perms failing", 91, 94, keeps, [](world &w, expected &x) {
+             x.at(93, {txt("rz"), ptr(nullptr), ptr(&w.perm)});
+             x.at(95, {i32(SEC_S_BAD_PERMISSION)});
+             return sec_translate_perms("rz", nullptr, &w.perm); }},
+        {"sec_translate_perms of no text", 91, 94, keeps, [](world &w, expected &x) {
+             x.at(93, {txt("<nil>"), ptr(nullptr), ptr(&w.perm)}), x.at(96, {i32(ok), u32(0)});
+             return sec_translate_perms(nullptr, nullptr, &w.perm); }},
+        {"sec_translate_bitmask", 97, 100, keeps, [](world &w, expected &x) {
+             x.at(99, {u32(3), ptr(nullptr), ptr(w.text)}), x.at(102, {i32(ok), txt("rw")});
+             return sec_translate_bitmask(3, nullptr, w.text); }},
+        {"sec_create_acle", 40, 43, clears, [](world &w, expected &x) {
+             x.at(42, {u32(4), u32(3), txt("unix"), txt("bob@host"), ptr(&w.acle)});
+             x.at(44, {i32(ok)});
+             return sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@host", &w.acle); }},
+        {"sec_display_acle_id", 49, 52, clears, [](world &w, expected &x) {
+             x.at(51, {ptr(w.acle), u32(4), u32(3), txt("unix"), txt("bob@host"), ptr(&w.mech),
+                       ptr(&w.id)});
+             x.at(54, {i32(ok), txt("unix"), txt("bob@host")});
+             return sec_display_acle_id(w.acle, &w.mech, &w.id); }},
+        {"sec_release_acle", 45, 48, release, [](world &w, expected &x) {
+             x.at(47, {ptr(w.acle), u8(4), u32(3), txt("unix"), txt("bob@host")}), x.at(48);
              sec_release_acle(w.acle);
-             return ok;
-         }},
-        {"sec_release_acle of no entry: a zeroed one", 45, 48, false, true,
-         [](world &, expected &x) {
-             x.at(47, {hex(null), hex(std::uint8_t{0}), hex(kx_uint32_t{0}), hex_text(""),
-                       hex_text("")});
-             x.at(48);
+             return ok; }},
+        // A null entry records as a zeroed one.
+        {"sec_release_acle of none", 45, 48, release, [](world &, expected &x) {
+             x.at(47, {ptr(nullptr), u8(0), u32(0), txt(""), txt("")}), x.at(48);
              sec_release_acle(nullptr);
-             return ok;
-         }},
-        {"sec_create_empty_acl records nothing", 0, 0, false, false,
-         [](world &, expected &) {
-             sec_buffer_s b{0, nullptr};
-             kx_int32_t rc = sec_create_empty_acl(&b);
-             std::free(b.value);
-             return rc;
-         }},
-        {"sec_read_acl_from_data", 15, 18, true, false,
-         [](world &w, expected &x) {
+             return ok; }},
+        {"sec_create_empty_acl records nothing", 0, 0, keeps, [](world &w, expected &) {
+             return sec_create_empty_acl(w.empty.get()); }},
+        {"sec_read_acl_from_data", 15, 18, clears, [](world &w, expected &x) {
              auto *b = const_cast<unsigned char *>(worked_example.data());
-             x.at(17, {hex(kx_int32_t{71}), hex(b), hex(w.acl.get())});
-             x.at(19, {hex(ok)});
-             return sec_read_acl_from_data(71, b, w.acl.get());
-         }},
-        {"sec_convert_acl_to_host", 55, 58, true, false,
-         [](world &w, expected &x) {
-             x.at(57,
-                  {hex(kx_uint32_t{1}), hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value)});
-             x.at(59, {hex(ok)});
-             return sec_convert_acl_to_host(1, w.acl.get());
-         }},
-        {"sec_list_acl", 20, 25, true, false,
-         [](world &w, expected &x) {
-             x.at(24, {hex(kx_int32_t{71}), hex(w.acl.d.value), hex(w.list.get())});
-             x.at(27, {hex(ok), hex(kx_int32_t{3})});
-             return sec_list_acl(w.acl.get(), w.list.get());
-         }},
-        {"sec_list_acl of no ACL", 20, 25, true, false,
-         [](world &w, expected &x) {
-             x.at(22, {hex(null), hex(w.typed.get())});
-             x.at(26, {hex(kx_int32_t{SEC_S_BAD_PARAM})});
-             return sec_list_acl(nullptr, w.typed.get());
-         }},
-        {"sec_list_acl_by_type", 28, 33, true, false,
-         [](world &w, expected &x) {
-             x.at(32, {hex(kx_int32_t{71}), hex(w.acl.d.value), hex(kx_uint32_t{16}), hex_text(""),
-                       hex(w.typed.get())});
-             x.at(35, {hex(ok), hex(kx_int32_t{1})});
-             return sec_list_acl_by_type(w.acl.get(), SEC_ACLE_GROUP, nullptr, w.typed.get());
-         }},
-        {"sec_list_acl_by_type of no ACL", 28, 33, true, false,
-         [](world &w, expected &x) {
-             char mech[] = "unix";
-             x.at(30, {hex(null), hex(kx_uint32_t{4}), hex_text("unix"), hex(w.list.get())});
-             x.at(34, {hex(kx_int32_t{SEC_S_BAD_PARAM})});
-             return sec_list_acl_by_type(nullptr, SEC_ACLE_USER, mech, w.list.get());
-         }},
-        {"sec_release_aclelist", 36, 39, false, true,
-         [](world &w, expected &x) {
-             x.at(38, {hex(w.list.get()), hex(kx_int32_t{3})});
-             x.at(39);
+             x.at(17, {i32(71), ptr(b), ptr(w.acl.get())}), x.at(19, {i32(ok)});
+             return sec_read_acl_from_data(71, b, w.acl.get()); }},
+        {"sec_convert_acl_to_host", 55, 58, clears, [](world &w, expected &x) {
+             x.at(57, {u32(1), ptr(w.acl.get()), i32(71), ptr(w.acl.d.value)}), x.at(59, {i32(ok)});
+             return sec_convert_acl_to_host(1, w.acl.get()); }},
+        {"sec_list_acl", 20, 25, clears, [](world &w, expected &x) {
+             x.at(24, {i32(71), ptr(w.acl.d.value), ptr(w.list.get())});
+             x.at(27, {i32(ok), i32(3)});
+             return sec_list_acl(w.acl.get(), w.list.get()); }},
+        {"sec_list_acl of no ACL", 20, 25, clears, [](world &w, expected &x) {
+             x.at(22, {ptr(nullptr), ptr(w.typed.get())}), x.at(26, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl(nullptr, w.typed.get()); }},
+        {"sec_list_acl_by_type", 28, 33, clears, [](world &w, expected &x) {
+             x.at(32, {i32(71), ptr(w.acl.d.value), u32(16), txt(""), ptr(w.typed.get())});
+             x.at(35, {i32(ok), i32(1)});
+             return sec_list_acl_by_type(w.acl.get(), SEC_ACLE_GROUP, nullptr, w.typed.get()); }},
+        {"sec_list_acl_by_type of no ACL", 28, 33, clears, [](world &w, expected &x) {
+             x.at(30, {ptr(nullptr), u32(4), txt("unix"), ptr(w.list.get())});
+             x.at(34, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl_by_type(nullptr, SEC_ACLE_USER, w.unix_mech, w.list.get()); }},
+        {"sec_release_aclelist", 36, 39, release, [](world &w, expected &x) {
+             x.at(38, {ptr(w.list.get()), i32(3)}), x.at(39);
              sec_release_aclelist(w.list.get());
-             return ok;
-         }},
-        {"sec_add_acle_to_acl", 60, 63, true, false,
-         [](world &w, expected &x) {
-             x.at(62,
-                  {hex(w.carol.p()), hex(kx_uint32_t{4}), hex(kx_uint32_t{7}), hex_text("unix"),
-                   hex_text("carol"), hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value)});
-             x.at(64, {hex(ok)});
-             return sec_add_acle_to_acl(w.carol.p(), w.acl.get());
-         }},
-        {"sec_add_acle_to_acl2 refusing", 60, 63, true, false,
-         [](world &w, expected &x) {
-             x.at(62,
-                  {hex(w.carol.p()), hex(kx_uint32_t{4}), hex(kx_uint32_t{7}), hex_text("unix"),
-                   hex_text("carol"), hex(w.acl.get()), hex(w.acl.d.length), hex(w.acl.d.value)});
-             x.at(64, {hex(kx_int32_t{SEC_S_BAD_ACLE})});
-             return sec_add_acle_to_acl2(w.carol.p(), w.acl.get());
-         }},
-        {"sec_del_acle_from_acl", 65, 68, true, false,
-         [](world &w, expected &x) {
-             x.at(67,
-                  {hex(w.carol.p()), hex(kx_uint32_t{4}), hex(kx_uint32_t{7}), hex_text("unix"),
-                   hex_text("carol"), hex(w.acl.get()), hex(w.acl.d.length), hex(w.acl.d.value)});
-             x.at(69, {hex(ok)});
-             return sec_del_acle_from_acl(w.carol.p(), w.acl.get());
-         }},
-        {"sec__register_id_handler", 74, 77, true, false,
-         [](world &, expected &x) {
+             return ok; }},
+        {"sec_add_acle_to_acl", 60, 63, clears, [](world &w, expected &x) {
+             x.at(62, edit_items(w));
+             x.at(64, {i32(ok)});
+             return sec_add_acle_to_acl(w.carol.p(), w.acl.get()); }},
+        {"sec_add_acle_to_acl2 refusing", 60, 63, clears, [](world &w, expected &x) {
+             x.at(62, edit_items(w));
+             x.at(64, {i32(SEC_S_BAD_ACLE)});
+             return sec_add_acle_to_acl2(w.carol.p(), w.acl.get()); }},
+        {"sec_del_acle_from_acl", 65, 68, clears, [](world &w, expected &x) {
+             x.at(67, edit_items(w));
+             x.at(69, {i32(ok)});
+             return sec_del_acle_from_acl(w.carol.p(), w.acl.get()); }},
+        {"sec__register_id_handler", 74, 77, clears, [](world &, expected &x) {
              sec_acl_id_handler h = handler;
-             x.at(76, {hex(kx_uint32_t{SEC_ID_HANDLER_USER}), hex_text("unix"), hex(h)});
-             x.at(78, {hex(ok)});
-             return sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler);
-         }},
-        {"sec__single_acle_perm", 79, 82, true, false,
-         [](world &w, expected &x) {
-             x.at(81, {hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value),
-                       hex(kx_uint32_t{4}), hex_text("unix"), hex_text("bob"), hex(&w.perm)});
-             x.at(84, {hex(ok), hex(kx_uint32_t{3})});
-             return single(w.acl.get(), SEC_ACLE_USER, "unix", "bob", &w.perm);
-         }},
-        {"sec__single_acle_perm refusing", 79, 82, true, false,
-         [](world &w, expected &x) {
-             x.at(81, {hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value),
-                       hex(kx_uint32_t{8}), hex_text("unix"), hex_text("bob"), hex(&w.perm)});
-             x.at(83, {hex(kx_int32_t{SEC_S_BAD_ACLE})});
-             return single(w.acl.get(), SEC_ACLE_EXPANDED, "unix", "bob", &w.perm);
-         }},
-        {"sec__group_acles_perm", 85, 88, true, false,
-         [](world &w, expected &x) {
-             static char staff[] = "staff";
-             static sec_buffer_s groups[] = {{6, staff}};
-             x.at(87, {hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value),
-                       hex(kx_int32_t{1}), hex(&groups[0]), hex(&w.perm)});
-             x.at(90, {hex(ok), hex(kx_uint32_t{1})});
-             return sec__group_acles_perm(w.acl.get(), 1, groups, &w.perm);
-         }},
-        {"sec_read_acl_file", 9, 12, true, false,
-         [](world &w, expected &x) {
-             x.at(11, {hex_text(w.dir.acl), hex_text(""), hex(no_set), hex(TEXT),
-                       hex(w.from_file.get())});
-             x.at(14, {hex(ok), hex(kx_int32_t{4})}); // the line reached
+             x.at(76, {u32(SEC_ID_HANDLER_USER), txt("unix"), hex_of(h)}), x.at(78, {i32(ok)});
+             return sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler); }},
+        {"sec__single_acle_perm", 79, 82, clears, [](world &w, expected &x) {
+             x.at(81, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), u32(4), txt("unix"),
+                       txt("bob"), ptr(&w.perm)});
+             x.at(84, {i32(ok), u32(3)});
+             return single(w.acl.get(), SEC_ACLE_USER, "unix", "bob", &w.perm); }},
+        {"sec__single_acle_perm refusing", 79, 82, clears, [](world &w, expected &x) {
+             x.at(81, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), u32(8), txt("unix"),
+                       txt("bob"), ptr(&w.perm)});
+             x.at(83, {i32(SEC_S_BAD_ACLE)});
+             return single(w.acl.get(), SEC_ACLE_EXPANDED, "unix", "bob", &w.perm); }},
+        {"sec__group_acles_perm", 85, 88, clears, [](world &w, expected &x) {
+             x.at(87, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), i32(1), ptr(w.groups),
+                       ptr(&w.perm)});
+             x.at(90, {i32(ok), u32(1)});
+             return sec__group_acles_perm(w.acl.get(), 1, w.groups, &w.perm); }},
+        // The exit carries the line reached.
+        {"sec_read_acl_file", 9, 12, clears, [](world &w, expected &x) {
+             x.at(11, {txt(w.dir.acl), txt(""), ptr(nullptr), u32(TEXT), ptr(w.from_file.get())});
+             x.at(14, {i32(ok), i32(4)});
              return sec_read_acl_file(w.dir.acl.c_str(), nullptr, nullptr, TEXT, w.from_file.get(),
-                                      &w.rflags);
-         }},
-        {"sec_release_acl", 70, 73, true, true,
-         [](world &w, expected &x) {
-             x.at(72, {hex(w.acl.get()), hex(kx_int32_t{71}), hex(w.acl.d.value)});
-             x.at(73);
-             return sec_release_acl(w.acl.get());
-         }},
+                                      &w.rflags); }},
+        {"sec_release_acl", 70, 73, clears | release, [](world &w, expected &x) {
+             x.at(72, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value)}), x.at(73);
+             return sec_release_acl(w.acl.get()); }},
     };
-}
-
-using trace_check =
-    std::function<void(const traced_call &, const std::vector<trace_record> &, const expected &)>;
-
-// Runs every traced call with tracing to file; check gets each call, the
-// records it left and the level-8 records it states.
-void run_traced_calls(const std::string &file, const trace_check &check) {
-    world w;
-    for (const traced_call &c : traced_calls()) {
-        SCOPED_TRACE(c.call);
-        std::size_t before = read_trace(file).size();
-        expected x;
-        bad_param("caller", 7, 0x1234u);
-        kx_int32_t rc = c.run(w, x);
-        // A success leaves the caller's record, or none when the call clears it.
-        if (rc == SEC_S_OK && c.clears) {
-            EXPECT_EQ(last_error().id, 0);
-        } else if (rc == SEC_S_OK) {
-            EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
-        }
-        std::vector<trace_record> all = read_trace(file);
-        check(c, {all.begin() + static_cast<long>(before), all.end()}, x);
-    }
+    // clang-format on
 }
 
 std::vector<unsigned> ids_of(const std::vector<trace_record> &records) {
@@ -623,54 +552,41 @@ std::vector<unsigned> ids_of(const std::vector<trace_record> &records) {
     return ids;
 }
 
-// The ids of a call at API level 1, or at another level when only a
-// release's exit is recorded.
-std::vector<unsigned> bare_ids(const traced_call &c, bool only_release_exit) {
-    if (only_release_exit)
-        return c.release ? std::vector<unsigned>{c.exit} : std::vector<unsigned>{};
-    return c.enter ? std::vector<unsigned>{c.enter, c.exit} : std::vector<unsigned>{};
-}
-
-TEST(ApiTrace, LevelEightRecordsTheData) {
-    std::string file = start_tracing("_SEL:API=8");
-    run_traced_calls(file, [](const traced_call &, const auto &got, const expected &x) {
-        std::vector<std::string> records;
-        for (const trace_record &r : got)
-            records.push_back(described(r.id, r.items));
-        EXPECT_EQ(records, x.records);
-    });
-}
-
-TEST(ApiTrace, LevelOneRecordsBareIds) {
-    std::string file = start_tracing("_SEL:API=1");
-    run_traced_calls(file, [](const traced_call &c, const auto &got, const expected &) {
-        EXPECT_EQ(ids_of(got), bare_ids(c, false));
-        for (const trace_record &r : got)
-            EXPECT_TRUE(r.items.empty()) << r.id;
-    });
-}
-
-// Other API levels record only the release exits; Perf 5 is not announced.
-TEST(ApiTrace, OtherLevelsRecordOnlyReleaseExits) {
-    std::string file = start_tracing("_SEL:API=4,Perf=5");
-    run_traced_calls(file, [](const traced_call &c, const auto &got, const expected &) {
-        EXPECT_EQ(ids_of(got), bare_ids(c, true));
-    });
+// Every traced call at API levels 8, 1, 4 and 0: at 8 the records with
+// their data, at 1 the bare entry and exit, at 4 only a release's exit, at
+// 0 nothing. A success leaves the caller's record, or none when the call
+// clears it. Perf 5 is not announced.
+TEST(ApiTrace, EveryLevel) {
+    std::string file = start_tracing("_SEL:API=8,Perf=5");
+    for (tr_detail_level_t level : {8, 1, 4, 0}) {
+        if (level != 8) { // the component registered at the first call
+            ASSERT_EQ(tr_set_detail_level_1("_SEL", "API", level), TR_OK);
+        }
+        world w;
+        for (const traced_call &c : traced_calls()) {
+            SCOPED_TRACE(std::string(c.call) + " at level " + std::to_string(level));
+            std::size_t before = read_trace(file).size();
+            expected x, bare;
+            bad_param("caller", 7, 0x1234u);
+            kx_int32_t rc = c.run(w, x);
+            if (rc == SEC_S_OK && (c.kind & clears)) {
+                EXPECT_EQ(last_error().id, 0);
+            } else if (rc == SEC_S_OK) {
+                EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
+            }
+            if (level == 1 && c.enter)
+                bare.at(c.enter), bare.at(c.exit);
+            else if (level == 4 && (c.kind & release))
+                bare.at(c.exit);
+            std::vector<std::string> got;
+            std::vector<trace_record> all = read_trace(file);
+            for (std::size_t i = before; i < all.size(); ++i)
+                got.push_back(described(all[i].id, all[i].items));
+            EXPECT_EQ(got, level == 8 ? x.records : bare.records);
+        }
+    }
     for (unsigned id : trace_ids(file))
         EXPECT_NE(id, 0u);
-}
-
-// Level 0 records nothing, yet registers the component; a level set later
-// applies to the next call.
-TEST(ApiTrace, LevelZeroRecordsNothing) {
-    std::string file = start_tracing("");
-    run_traced_calls(file, [](const traced_call &, const auto &got, const expected &) {
-        EXPECT_TRUE(got.empty());
-    });
-    ASSERT_EQ(tr_set_detail_level_1("_SEL", "API", 1), TR_OK);
-    kx_uint32_t mask;
-    sec_translate_perms("r", nullptr, &mask);
-    EXPECT_EQ(trace_ids(file), (std::vector<unsigned>{91, 94}));
 }
 
 TEST(ApiTrace, PerfLevelIsAnnouncedAtRegistration) {
@@ -678,7 +594,7 @@ TEST(ApiTrace, PerfLevelIsAnnouncedAtRegistration) {
     kx_uint32_t mask;
     sec_translate_perms("r", nullptr, &mask);
     ASSERT_EQ(trace_ids(file), (std::vector<unsigned>{0}));
-    EXPECT_EQ(read_trace(file)[0].items, (std::vector<std::string>{hex(kx_int32_t{2})}));
+    EXPECT_EQ(read_trace(file)[0].items, (std::vector<std::string>{i32(2)}));
 }
 
 // A registration that the trace library refuses leaves the caller's record.
@@ -706,7 +622,7 @@ TEST(FileTrace, InfoPoints) {
     // Examine, absent, open the text, cache absent; examine, open the CACL file.
     ASSERT_EQ(ids_of(records), (std::vector<unsigned>{117, 118, 121, 110, 117, 121}));
     EXPECT_EQ(records[0].items, (std::vector<std::string>{hex_text(d.cacl)}));
-    EXPECT_EQ(records[1].items[1], hex(ENOENT));
+    EXPECT_EQ(records[1].items[1], i32(ENOENT));
     EXPECT_EQ(records[2].items, (std::vector<std::string>{hex_text(d.acl)}));
     EXPECT_EQ(records[5].items, (std::vector<std::string>{hex_text(d.cacl)}));
 
@@ -723,8 +639,8 @@ TEST(FileTrace, InfoPoints) {
     ASSERT_EQ(records[8].id, 120u);
     ASSERT_EQ(records[8].items.size(), 7u);
     EXPECT_EQ(records[8].items[0], hex_text(foreign.acl));
-    EXPECT_EQ(records[8].items[5], hex(kx_uint32_t{S_IFREG | 0644}));
-    EXPECT_EQ(records[8].items[6], hex(kx_uint32_t{S_IFREG | 0600}));
+    EXPECT_EQ(records[8].items[5], u32(S_IFREG | 0644));
+    EXPECT_EQ(records[8].items[6], u32(S_IFREG | 0600));
 
     ASSERT_EQ(tr_set_detail_level_1("_SEL", "Info", 8), TR_OK);
     ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
@@ -733,7 +649,7 @@ TEST(FileTrace, InfoPoints) {
         if (r.id == 114)
             lines.push_back(r.items);
     auto line = [](int n, int type, const char *id, kx_uint32_t perm) {
-        return std::vector<std::string>{hex(n), hex(type), hex_text(""), hex_text(id), hex(perm)};
+        return std::vector<std::string>{i32(n), i32(type), txt(""), txt(id), u32(perm)};
     };
     EXPECT_EQ(lines, (std::vector<std::vector<std::string>>{line(1, 2, "", 1), line(2, 0, "", 0),
                                                             line(3, 16, "staff", 3)}));
@@ -751,7 +667,7 @@ TEST(FileTrace, PerfPointsOfACompile) {
     EXPECT_EQ(records[1].items.size(), 4u);
     EXPECT_EQ(records[2].items.size(), 4u);
     ASSERT_EQ(records[3].items.size(), 5u);
-    EXPECT_EQ(records[3].items[1], hex(4));
+    EXPECT_EQ(records[3].items[1], i32(4));
 }
 
 } // namespace
