@@ -1,5 +1,7 @@
-// Entry trees: order, duplicates, the array of trees and the buffer it
-// makes.
+// Entry trees: identities that share their first bytes, many identities,
+// the array of trees and the buffer it makes. The order of entries and the
+// refusal or merging of duplicates show through listing and editing
+// (buffers_test).
 #include <cstdio>
 #include <string>
 #include <vector>
@@ -35,19 +37,6 @@ struct owned_tree {
     }
 };
 
-TEST(Acltree, UserAndGroupByIdentityExpandedAsAdded) {
-    owned_tree user, group, expanded;
-    for (const char *id : {"c", "a", "B"})
-        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
-    for (const char *id : {"wheel", "Staff", "_x", "Zeta"})
-        ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 2, "", id}), SEC_S_OK);
-    for (const char *id : {"z", "a", "m"})
-        ASSERT_EQ(expanded.add(1, {SEC_ACLE_EXPANDED, 3, "unix", id}), SEC_S_OK);
-    EXPECT_EQ(user.walked(), (texts{"a/1", "B/1", "c/1"}));
-    EXPECT_EQ(group.walked(), (texts{"_x/2", "Staff/2", "wheel/2", "Zeta/2"}));
-    EXPECT_EQ(expanded.walked(), (texts{"z/3", "a/3", "m/3"}));
-}
-
 // Nodes order by the first eight folded bytes and only then by the rest:
 // identities that share those bytes, or end within them, still order and
 // collide exactly as the comparison says.
@@ -64,28 +53,6 @@ TEST(Acltree, IdentitiesSharingTheirFirstEightBytes) {
     entry gone{SEC_ACLE_USER, 0, "unix", "PREFIX-OF-TAIL-a"};
     EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
     EXPECT_EQ(user.walked().size(), 6u);
-}
-
-TEST(Acltree, DuplicatesRefusedOrMerged) {
-    owned_tree user, group, anyother;
-    ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "Alice"}), SEC_S_OK);
-    EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 2, "UNIX", "alice"}), SEC_S_BAD_ACLE);
-    error_record e = expect_error(SEC_S_BAD_ACLE, MSG_2650_157);
-    EXPECT_EQ(e.num(0), 'u');
-    EXPECT_EQ(e.str(1) + " " + e.str(2), "UNIX alice");
-    EXPECT_EQ(user.walked(), texts{"Alice/1"});
-    EXPECT_EQ(user.add(0, {SEC_ACLE_USER, 2, "unix", "alice"}), SEC_S_OK);
-    EXPECT_EQ(user.walked(), texts{"Alice/2"});
-
-    ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "staff"}), SEC_S_OK);
-    EXPECT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "Staff"}), SEC_S_BAD_ACLE);
-    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_175).str(1), "Staff");
-
-    ASSERT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 1}), SEC_S_OK);
-    EXPECT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 4}), SEC_S_BAD_ACLE);
-    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_174).num(0), 'o');
-    EXPECT_EQ(anyother.add(0, {SEC_ACLE_ANYOTHER, 4}), SEC_S_OK);
-    EXPECT_EQ(anyother.walked(), texts{"-/4"});
 }
 
 // One tree per key in order of first occurrence; the worked example and the
