@@ -144,18 +144,51 @@ TEST(ParseText, UsedUpTextReturnsZeroAndClearsTheEntry) {
     EXPECT_EQ(r.lineno, 7);
 }
 
-TEST(ParseText, LastLineWithoutLineEndIsParsed) {
-    text_reader r("n\no r");
-    ASSERT_EQ(r.next(), 1);
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.length, 4u);
-    ASSERT_EQ(r.next(), 1);
-    expect_entry(r.acle, {SEC_ACLE_ANYOTHER, "", nullptr, 0x1});
-    EXPECT_EQ(r.cursor, nullptr);
-    EXPECT_EQ(r.length, 4u);
-    EXPECT_EQ(r.lineno, 3);
-    EXPECT_EQ(r.next(), 0);
-    EXPECT_EQ(r.lineno, 3);
+// Texts read line by line: after each call its result, the message of a
+// refusal (whose first argument is the line), the line number, the cursor's
+// offset (-1: none) and the remaining length. A failure moves past its
+// line but keeps the length; one on the last line leaves no cursor. A NUL
+// at a line's start ends the text; inside a line it is corrupt, and the
+// cursor stays at the line's start, unless another fault comes first.
+TEST(ParseText, Sequences) {
+    struct step {
+        kx_int32_t rc;
+        int msg;
+        int lineno;
+        long cursor;
+        std::size_t length;
+    };
+    const kx_int32_t bad = SEC_S_BAD_ACL;
+    const struct {
+        std::string text;
+        std::vector<step> steps;
+    } cases[] = {
+        {"n\no r", {{1, 0, 2, 2, 4}, {1, 0, 3, -1, 4}, {0, 0, 3, -1, 4}}},
+        {"n\nu unix\ng staff\n", {{1, 0, 2, 2, 16}, {bad, MSG_2650_172, 3, 9, 16}}},
+        {"n r\nnr", {{1, 0, 2, 4, 3}, {bad, MSG_2650_179, 3, -1, 3}}},
+        {std::string("n\n\0o\n", 5), {{1, 0, 2, 2, 4}, {0, 0, 2, 2, 4}}},
+        {std::string("n\no r\0x\n", 8), {{1, 0, 2, 2, 7}, {bad, MSG_2650_144, 3, 2, 7}}},
+        {std::string("nr\0\n", 4), {{bad, MSG_2650_179, 2, -1, 5}}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.text);
+        text_reader r(c.text);
+        for (const step &s : c.steps) {
+            EXPECT_EQ(r.next(), s.rc);
+            if (s.msg) {
+                EXPECT_EQ(kxtest::last_error().msg_num, s.msg);
+                EXPECT_EQ(kxtest::last_error().num(0), s.lineno - 1);
+            }
+            EXPECT_EQ(r.lineno, s.lineno);
+            EXPECT_EQ(r.cursor, s.cursor < 0 ? nullptr : r.at(static_cast<std::size_t>(s.cursor)));
+            EXPECT_EQ(r.length, s.length);
+        }
+    }
+    expected_entry other_r{SEC_ACLE_ANYOTHER, "", nullptr, 0x1};
+    text_reader last("n\no r"); // the last line without its line end
+    last.next();
+    ASSERT_EQ(last.next(), 1);
+    expect_entry(last.acle, other_r);
 }
 
 TEST(ParseText, EachLineEndEndsOneLine) {
@@ -259,25 +292,6 @@ TEST(ParseText, CallerTemplateSetTranslatesPermissions) {
     EXPECT_EQ(none.next(), 1); // no permission token, nothing to translate
 }
 
-TEST(ParseText, FailureMovesPastTheLineAndKeepsTheLength) {
-    text_reader r("n\nu unix\ng staff\n");
-    ASSERT_EQ(r.next(), 1);
-    std::size_t length = r.length;
-    EXPECT_EQ(r.next(), SEC_S_BAD_ACL);
-    EXPECT_TRUE(kxtest::record_is(SEC_S_BAD_ACL, MSG_2650_172, {2}));
-    EXPECT_EQ(r.cursor, r.at(9));
-    EXPECT_EQ(r.length, length);
-    EXPECT_EQ(r.lineno, 3);
-
-    // Failing on the last line leaves no cursor.
-    text_reader last("n r\nnr");
-    ASSERT_EQ(last.next(), 1);
-    EXPECT_EQ(last.next(), SEC_S_BAD_ACL);
-    EXPECT_EQ(last.cursor, nullptr);
-    EXPECT_EQ(last.length, 3u);
-    EXPECT_EQ(last.lineno, 3);
-}
-
 TEST(ParseText, LinesUpTo1096BytesWithTheirEnd) {
     std::string comment = "#" + std::string(1094, 'c') + "\n";
     std::string entry = "g " + std::string(1093, 's') + "\n";
@@ -316,35 +330,6 @@ TEST(ParseText, LongerLinesFailWithTheirNumberAndLength) {
     EXPECT_EQ(items, (std::vector<std::vector<std::string>>{
                          {kxtest::hex_of(two), kxtest::hex_of(first)},
                          {kxtest::hex_of(three), kxtest::hex_of(second)}}));
-}
-
-TEST(ParseText, NulAtTheStartOfALineEndsTheText) {
-    std::string file("n\n\0o\n", 5);
-    text_reader r(file);
-    ASSERT_EQ(r.next(), 1);
-    EXPECT_EQ(r.next(), 0);
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.lineno, 2);
-    EXPECT_EQ(kxtest::last_error().id, 0);
-}
-
-TEST(ParseText, NulInsideALineIsCorrupt) {
-    std::string file("n\no r\0x\n", 8);
-    text_reader r(file);
-    ASSERT_EQ(r.next(), 1);
-    std::size_t length = r.length;
-    expect_error(MSG_2650_144, SEC_S_BAD_ACL, r.next());
-    EXPECT_EQ(kxtest::last_error().num(0), 2);
-    // The cursor stays at the line's start, the length as it was.
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.length, length);
-    EXPECT_EQ(r.lineno, 3);
-
-    // Another fault of the line is reported first.
-    text_reader bad(std::string("nr\0\n", 4));
-    EXPECT_EQ(bad.next(), SEC_S_BAD_ACL);
-    EXPECT_EQ(kxtest::last_error().msg_num, MSG_2650_179);
-    EXPECT_EQ(bad.cursor, nullptr);
 }
 
 TEST(ParseText, NeverReadsPastTheRemainingLength) {
