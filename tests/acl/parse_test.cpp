@@ -351,6 +351,15 @@ TEST(ParseText, NeverReadsPastTheRemainingLength) {
     ASSERT_EQ(r.next(), 1);
     EXPECT_EQ(r.length, 0u);
     EXPECT_EQ(r.next(), 0);
+
+    // Too long a line without an end within the length leaves no cursor.
+    std::unique_ptr<char[]> long_bytes(new char[1200]);
+    std::memset(long_bytes.get(), 'c', 1200);
+    cursor = long_bytes.get();
+    length = 1200;
+    expect_error(MSG_2650_158, SEC_S_FILE_ERROR,
+                 sec__read_acle_from_text(nullptr, &cursor, &length, &lineno, &acle));
+    EXPECT_EQ(cursor, nullptr);
 }
 
 TEST(ParseText, TokensEndAtLocaleWhiteSpace) {
