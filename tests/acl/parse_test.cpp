@@ -1,3 +1,6 @@
+// The ACL text parser, line by line: one table of single lines with the
+// entry or the refusal each gives, then the cursor, the remaining length and
+// the line number across lines, line ends, long lines, NULs and locales.
 #include <cctype>
 #include <clocale>
 #include <cstring>
@@ -10,6 +13,7 @@
 #include <kx_acl.h>
 
 #include "alloc.h"
+#include "messages.h"
 #include "parse.h"
 #include "support.h"
 
@@ -55,14 +59,6 @@ void expect_entry(const sec_acle_desc &acle, const expected_entry &e) {
     EXPECT_EQ(acle.perm, e.perm);
 }
 
-// One line that parses to one entry.
-void expect_line(const std::string &line, const expected_entry &e) {
-    SCOPED_TRACE(line);
-    text_reader r(line);
-    ASSERT_EQ(r.next(), 1) << kxtest::last_error().text;
-    expect_entry(r.acle, e);
-}
-
 void expect_error(int msg_num, kx_int32_t status, kx_int32_t rc) {
     EXPECT_EQ(rc, status);
     kxtest::error_record err = kxtest::last_error();
@@ -70,26 +66,25 @@ void expect_error(int msg_num, kx_int32_t status, kx_int32_t rc) {
     EXPECT_EQ(err.msg_num, msg_num);
 }
 
-// A line that fails with a message carrying the line number and a token.
-void expect_token_error(const std::string &file, int msg_num, kx_int32_t status,
-                        const std::string &token) {
-    SCOPED_TRACE(file);
-    text_reader r(file);
-    expect_error(msg_num, status, r.next());
-    kxtest::error_record err = kxtest::last_error();
-    ASSERT_EQ(err.args.size(), 2u);
-    EXPECT_EQ(err.num(0), 1);
-    EXPECT_EQ(err.str(1), token);
-}
+// One line of text: the entry it gives (status 1), or its refusal with the
+// message and arguments, which start with the line number.
+struct line_case {
+    const char *text;
+    kx_int32_t status;
+    expected_entry entry; // status 1
+    int msg = 0;          // otherwise
+    std::vector<kxtest::arg> args = {};
+};
 
-// A line that fails with a message carrying the line number alone.
-void expect_line_error(const std::string &file, int msg_num, kx_int32_t status) {
-    SCOPED_TRACE(file);
-    text_reader r(file);
-    expect_error(msg_num, status, r.next());
-    kxtest::error_record err = kxtest::last_error();
-    ASSERT_EQ(err.args.size(), 1u);
-    EXPECT_EQ(err.num(0), 1);
+void expect_line(const line_case &c) {
+    SCOPED_TRACE(c.text);
+    text_reader r(c.text);
+    kx_int32_t rc = r.next();
+    EXPECT_EQ(rc, c.status);
+    if (rc == 1)
+        expect_entry(r.acle, c.entry);
+    else
+        EXPECT_TRUE(kxtest::record_is(c.status, c.msg, c.args));
 }
 
 const char example_file[] = "#ACL for the example resource\n"
@@ -149,18 +144,51 @@ TEST(ParseText, UsedUpTextReturnsZeroAndClearsTheEntry) {
     EXPECT_EQ(r.lineno, 7);
 }
 
-TEST(ParseText, LastLineWithoutLineEndIsParsed) {
-    text_reader r("n\no r");
-    ASSERT_EQ(r.next(), 1);
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.length, 4u);
-    ASSERT_EQ(r.next(), 1);
-    expect_entry(r.acle, {SEC_ACLE_ANYOTHER, "", nullptr, 0x1});
-    EXPECT_EQ(r.cursor, nullptr);
-    EXPECT_EQ(r.length, 4u);
-    EXPECT_EQ(r.lineno, 3);
-    EXPECT_EQ(r.next(), 0);
-    EXPECT_EQ(r.lineno, 3);
+// Texts read line by line: after each call its result, the message of a
+// refusal (whose first argument is the line), the line number, the cursor's
+// offset (-1: none) and the remaining length. A failure moves past its
+// line but keeps the length; one on the last line leaves no cursor. A NUL
+// at a line's start ends the text; inside a line it is corrupt, and the
+// cursor stays at the line's start, unless another fault comes first.
+TEST(ParseText, Sequences) {
+    struct step {
+        kx_int32_t rc;
+        int msg;
+        int lineno;
+        long cursor;
+        std::size_t length;
+    };
+    const kx_int32_t bad = SEC_S_BAD_ACL;
+    const struct {
+        std::string text;
+        std::vector<step> steps;
+    } cases[] = {
+        {"n\no r", {{1, 0, 2, 2, 4}, {1, 0, 3, -1, 4}, {0, 0, 3, -1, 4}}},
+        {"n\nu unix\ng staff\n", {{1, 0, 2, 2, 16}, {bad, MSG_2650_172, 3, 9, 16}}},
+        {"n r\nnr", {{1, 0, 2, 4, 3}, {bad, MSG_2650_179, 3, -1, 3}}},
+        {std::string("n\n\0o\n", 5), {{1, 0, 2, 2, 4}, {0, 0, 2, 2, 4}}},
+        {std::string("n\no r\0x\n", 8), {{1, 0, 2, 2, 7}, {bad, MSG_2650_144, 3, 2, 7}}},
+        {std::string("nr\0\n", 4), {{bad, MSG_2650_179, 2, -1, 5}}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.text);
+        text_reader r(c.text);
+        for (const step &s : c.steps) {
+            EXPECT_EQ(r.next(), s.rc);
+            if (s.msg) {
+                EXPECT_EQ(kxtest::last_error().msg_num, s.msg);
+                EXPECT_EQ(kxtest::last_error().num(0), s.lineno - 1);
+            }
+            EXPECT_EQ(r.lineno, s.lineno);
+            EXPECT_EQ(r.cursor, s.cursor < 0 ? nullptr : r.at(static_cast<std::size_t>(s.cursor)));
+            EXPECT_EQ(r.length, s.length);
+        }
+    }
+    expected_entry other_r{SEC_ACLE_ANYOTHER, "", nullptr, 0x1};
+    text_reader last("n\no r"); // the last line without its line end
+    last.next();
+    ASSERT_EQ(last.next(), 1);
+    expect_entry(last.acle, other_r);
 }
 
 TEST(ParseText, EachLineEndEndsOneLine) {
@@ -188,72 +216,64 @@ TEST(ParseText, EachLineEndEndsOneLine) {
     }
     EXPECT_EQ(failed, (std::vector<long long>{1, 3, 5}));
     EXPECT_EQ(crlf.lineno, 7);
+
+    // FF is no blank: it ends the line before the permissions.
+    text_reader ff("n\f r\n");
+    ASSERT_EQ(ff.next(), 1);
+    expect_entry(ff.acle, {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0});
+    EXPECT_EQ(ff.next(), SEC_S_BAD_ACL);
+    EXPECT_TRUE(kxtest::record_is(SEC_S_BAD_ACL, MSG_2650_179, {2, "r"}));
 }
 
-TEST(ParseText, TypesMechanismsAndIdentities) {
-    expect_line("n", {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0});
-    expect_line("N", {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0});
-    expect_line("O rw", {SEC_ACLE_ANYOTHER, "", nullptr, 0x3});
-    expect_line("g staff", {SEC_ACLE_GROUP, "", "staff", 0});
-    expect_line("G staff r", {SEC_ACLE_GROUP, "", "staff", 0x1});
-    expect_line("u unix joe", {SEC_ACLE_USER, "unix", "joe", 0});
-    expect_line("U unix joe", {SEC_ACLE_USER, "unix", "joe", 0});
-    expect_line("u UNIX joe", {SEC_ACLE_USER, "unix", "joe", 0});
-    expect_line("E KrB5 Joe@Realm rr", {SEC_ACLE_EXPANDED, "krb5", "Joe@Realm", 0x1});
-    // A '#' inside a token belongs to it.
-    expect_line("g staff#r", {SEC_ACLE_GROUP, "", "staff#r", 0});
-    expect_line("o rw #comment", {SEC_ACLE_ANYOTHER, "", nullptr, 0x3});
-    expect_line("g staff #rw", {SEC_ACLE_GROUP, "", "staff", 0});
-    // Blanks are space, tab and vertical tab.
-    expect_line(" \t\vn \t\vr\t", {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0x1});
-    expect_line("\t", {0, "", nullptr, 0});
-    expect_line("   # n r", {0, "", nullptr, 0});
-    // FF is not skipped: it ends the line before the permissions.
-    text_reader r("n\f r\n");
-    ASSERT_EQ(r.next(), 1);
-    expect_entry(r.acle, {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0});
-    EXPECT_EQ(r.next(), SEC_S_BAD_ACL);
-    EXPECT_EQ(kxtest::last_error().msg_num, 165);
-    EXPECT_EQ(kxtest::last_error().num(0), 2);
+TEST(ParseText, OneLine) {
+    const kx_int32_t ok = 1, bad = SEC_S_BAD_ACL, perm = SEC_S_BAD_PERMISSION;
+    const expected_entry none{0, "", nullptr, 0}, n{SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0},
+        joe{SEC_ACLE_USER, "unix", "joe", 0}, staff{SEC_ACLE_GROUP, "", "staff", 0};
+    // clang-format off
+    const line_case cases[] = {
+        {"n", ok, n}, {"N", ok, n},
+        {"O rw", ok, {SEC_ACLE_ANYOTHER, "", nullptr, 0x3}},
+        {"g staff", ok, staff}, {"G staff r", ok, {SEC_ACLE_GROUP, "", "staff", 0x1}},
+        {"u unix joe", ok, joe}, {"U unix joe", ok, joe}, {"u UNIX joe", ok, joe},
+        {"E KrB5 Joe@Realm rr", ok, {SEC_ACLE_EXPANDED, "krb5", "Joe@Realm", 0x1}},
+        {"u ABCDEFGHIJKLMNOP joe", ok, {SEC_ACLE_USER, "abcdefghijklmnop", "joe", 0}},
+        // A '#' inside a token belongs to it; one that starts a token ends the line.
+        {"g staff#r", ok, {SEC_ACLE_GROUP, "", "staff#r", 0}},
+        {"o rw #comment", ok, {SEC_ACLE_ANYOTHER, "", nullptr, 0x3}},
+        {"g staff #rw", ok, staff},
+        // Blanks are space, tab and vertical tab.
+        {" \t\vn \t\vr\t", ok, {SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0x1}},
+        {"\t", ok, none}, {"   # n r", ok, none},
+        // Missing and extra tokens.
+        {"u unix\n", bad, {}, MSG_2650_172, {1}}, {"u\n", bad, {}, MSG_2650_172, {1}},
+        {"e unix #joe\n", bad, {}, MSG_2650_172, {1}}, {"g # staff\n", bad, {}, MSG_2650_172, {1}},
+        {"n rw x\n", bad, {}, MSG_2650_173, {1}}, {"o rw extra", bad, {}, MSG_2650_173, {1}},
+        {"u unix joe r w", bad, {}, MSG_2650_173, {1}},
+        // The type token must be one type character.
+        {"x joe r\n", bad, {}, MSG_2650_179, {1, "x"}}, {"nr\n", bad, {}, MSG_2650_179, {1, "nr"}},
+        {"n#x\n", bad, {}, MSG_2650_179, {1, "n#x"}},
+        {"  uu unix joe", bad, {}, MSG_2650_179, {1, "uu"}},
+        // Bad permissions are reported as the whole token.
+        {"g staff rz\n", perm, {}, MSG_2650_180, {1, "rz"}}, {"o R", perm, {}, MSG_2650_180, {1, "R"}},
+        {"u ABCDEFGHIJKLMNOPQ joe\n", bad, {}, MSG_2650_145, {"ABCDEFGHIJKLMNOPQ", 1}},
+    };
+    // clang-format on
+    for (const line_case &c : cases)
+        expect_line(c);
 }
 
-TEST(ParseText, MechanismOfSixteenCharactersIsLowercasedInPlace) {
-    text_reader r("u ABCDEFGHIJKLMNOP joe\n");
+// The mechanism is lowercased in the text itself, as in the POSIX locale;
+// a refused one moves the cursor past its line.
+TEST(ParseText, MechanismIsLowercasedInPlaceAsInThePosixLocale) {
+    text_reader r("u ABCDEFGHIJKLMNOP joe\nu ABCDEFGHIJKLMNOPQ joe\n");
     ASSERT_EQ(r.next(), 1);
-    EXPECT_STREQ(r.acle.mech, "abcdefghijklmnop");
     EXPECT_STREQ(r.at(2), "abcdefghijklmnop");
+    EXPECT_EQ(r.next(), SEC_S_BAD_ACL);
+    EXPECT_EQ(r.cursor, r.at(47));
 
-    text_reader longer("u ABCDEFGHIJKLMNOPQ joe\n");
-    expect_error(132, SEC_S_BAD_ACL, longer.next());
-    kxtest::error_record err = kxtest::last_error();
-    ASSERT_EQ(err.args.size(), 2u);
-    EXPECT_EQ(err.str(0), "ABCDEFGHIJKLMNOPQ");
-    EXPECT_EQ(err.num(1), 1);
-    EXPECT_EQ(longer.cursor, longer.at(24));
-}
-
-TEST(ParseText, MechanismIsLowercasedAsInThePosixLocale) {
     ASSERT_TRUE(kxtest::use_build_locale("en_US.ISO-8859-1"));
     ASSERT_EQ(std::tolower(0xc9), 0xe9); // the locale itself would fold it
-    expect_line("u UN\xc9X joe", {SEC_ACLE_USER, "un\xc9x", "joe", 0});
-}
-
-TEST(ParseText, MissingAndExtraTokens) {
-    expect_line_error("u unix\n", 158, SEC_S_BAD_ACL);
-    expect_line_error("u\n", 158, SEC_S_BAD_ACL);
-    expect_line_error("e unix #joe\n", 158, SEC_S_BAD_ACL);
-    expect_line_error("g # staff\n", 158, SEC_S_BAD_ACL);
-    expect_line_error("n rw x\n", 159, SEC_S_BAD_ACL);
-    expect_line_error("o rw extra", 159, SEC_S_BAD_ACL);
-    expect_line_error("u unix joe r w", 159, SEC_S_BAD_ACL);
-    // The type token must be one type character.
-    expect_token_error("x joe r\n", 165, SEC_S_BAD_ACL, "x");
-    expect_token_error("nr\n", 165, SEC_S_BAD_ACL, "nr");
-    expect_token_error("n#x\n", 165, SEC_S_BAD_ACL, "n#x");
-    expect_token_error("  uu unix joe", 165, SEC_S_BAD_ACL, "uu");
-    // Bad permissions are reported as the whole token.
-    expect_token_error("g staff rz\n", 166, SEC_S_BAD_PERMISSION, "rz");
-    expect_token_error("o R", 166, SEC_S_BAD_PERMISSION, "R");
+    expect_line({"u UN\xc9X joe", 1, {SEC_ACLE_USER, "un\xc9x", "joe", 0}});
 }
 
 TEST(ParseText, CallerTemplateSetTranslatesPermissions) {
@@ -263,34 +283,13 @@ TEST(ParseText, CallerTemplateSetTranslatesPermissions) {
     r.permset = &set;
     ASSERT_EQ(r.next(), 1);
     EXPECT_EQ(r.acle.perm, 0x101u);
-    expect_error(166, SEC_S_BAD_PERMISSION, r.next());
-    kxtest::error_record err = kxtest::last_error();
-    EXPECT_EQ(err.num(0), 2);
-    EXPECT_EQ(err.str(1), "w");
+    EXPECT_EQ(r.next(), SEC_S_BAD_PERMISSION);
+    EXPECT_TRUE(kxtest::record_is(SEC_S_BAD_PERMISSION, MSG_2650_180, {2, "w"}));
 
     sec_perm_set_desc empty{0, nullptr};
     text_reader none("n\n");
     none.permset = &empty;
     EXPECT_EQ(none.next(), 1); // no permission token, nothing to translate
-}
-
-TEST(ParseText, FailureMovesPastTheLineAndKeepsTheLength) {
-    text_reader r("n\nu unix\ng staff\n");
-    ASSERT_EQ(r.next(), 1);
-    std::size_t length = r.length;
-    expect_error(158, SEC_S_BAD_ACL, r.next());
-    EXPECT_EQ(kxtest::last_error().num(0), 2);
-    EXPECT_EQ(r.cursor, r.at(9));
-    EXPECT_EQ(r.length, length);
-    EXPECT_EQ(r.lineno, 3);
-
-    // Failing on the last line leaves no cursor.
-    text_reader last("n r\nnr");
-    ASSERT_EQ(last.next(), 1);
-    EXPECT_EQ(last.next(), SEC_S_BAD_ACL);
-    EXPECT_EQ(last.cursor, nullptr);
-    EXPECT_EQ(last.length, 3u);
-    EXPECT_EQ(last.lineno, 3);
 }
 
 TEST(ParseText, LinesUpTo1096BytesWithTheirEnd) {
@@ -314,11 +313,11 @@ TEST(ParseText, LongerLinesFailWithTheirNumberAndLength) {
     text_reader r("n\n" + comment + "g " + std::string(1094, 's'));
     ASSERT_EQ(r.next(), 1);
     std::size_t length = r.length;
-    expect_error(145, SEC_S_FILE_ERROR, r.next());
+    expect_error(MSG_2650_158, SEC_S_FILE_ERROR, r.next());
     EXPECT_EQ(kxtest::last_error().num(0), 2);
     EXPECT_EQ(r.cursor, r.at(2 + 1097));
     EXPECT_EQ(r.length, length);
-    expect_error(145, SEC_S_FILE_ERROR, r.next());
+    expect_error(MSG_2650_158, SEC_S_FILE_ERROR, r.next());
     EXPECT_EQ(kxtest::last_error().num(0), 3);
     EXPECT_EQ(r.cursor, nullptr);
 
@@ -333,35 +332,6 @@ TEST(ParseText, LongerLinesFailWithTheirNumberAndLength) {
                          {kxtest::hex_of(three), kxtest::hex_of(second)}}));
 }
 
-TEST(ParseText, NulAtTheStartOfALineEndsTheText) {
-    std::string file("n\n\0o\n", 5);
-    text_reader r(file);
-    ASSERT_EQ(r.next(), 1);
-    EXPECT_EQ(r.next(), 0);
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.lineno, 2);
-    EXPECT_EQ(kxtest::last_error().id, 0);
-}
-
-TEST(ParseText, NulInsideALineIsCorrupt) {
-    std::string file("n\no r\0x\n", 8);
-    text_reader r(file);
-    ASSERT_EQ(r.next(), 1);
-    std::size_t length = r.length;
-    expect_error(131, SEC_S_BAD_ACL, r.next());
-    EXPECT_EQ(kxtest::last_error().num(0), 2);
-    // The cursor stays at the line's start, the length as it was.
-    EXPECT_EQ(r.cursor, r.at(2));
-    EXPECT_EQ(r.length, length);
-    EXPECT_EQ(r.lineno, 3);
-
-    // Another fault of the line is reported first.
-    text_reader bad(std::string("nr\0\n", 4));
-    EXPECT_EQ(bad.next(), SEC_S_BAD_ACL);
-    EXPECT_EQ(kxtest::last_error().msg_num, 165);
-    EXPECT_EQ(bad.cursor, nullptr);
-}
-
 TEST(ParseText, NeverReadsPastTheRemainingLength) {
     // Three bytes without a NUL of their own: a length of 3 promises a
     // terminator within them, and nothing beyond may be read.
@@ -370,7 +340,7 @@ TEST(ParseText, NeverReadsPastTheRemainingLength) {
     std::size_t length = 3;
     int lineno = 1;
     sec_acle_desc acle{};
-    expect_error(131, SEC_S_BAD_ACL,
+    expect_error(MSG_2650_144, SEC_S_BAD_ACL,
                  sec__read_acle_from_text(nullptr, &cursor, &length, &lineno, &acle));
     EXPECT_EQ(cursor, bytes.get());
     EXPECT_EQ(lineno, 2);
@@ -381,19 +351,28 @@ TEST(ParseText, NeverReadsPastTheRemainingLength) {
     ASSERT_EQ(r.next(), 1);
     EXPECT_EQ(r.length, 0u);
     EXPECT_EQ(r.next(), 0);
+
+    // Too long a line without an end within the length leaves no cursor.
+    std::unique_ptr<char[]> long_bytes(new char[1200]);
+    std::memset(long_bytes.get(), 'c', 1200);
+    cursor = long_bytes.get();
+    length = 1200;
+    expect_error(MSG_2650_158, SEC_S_FILE_ERROR,
+                 sec__read_acle_from_text(nullptr, &cursor, &length, &lineno, &acle));
+    EXPECT_EQ(cursor, nullptr);
 }
 
 TEST(ParseText, TokensEndAtLocaleWhiteSpace) {
     const std::string line = "g\xa0staff\xa0rw";
     ASSERT_TRUE(kxtest::use_build_locale("kx_space.ISO-8859-1")) << "the test locale was not built";
     ASSERT_NE(std::isspace(0xa0), 0);
-    expect_line(line, {SEC_ACLE_GROUP, "", "staff", 0x3});
+    expect_line({line.c_str(), 1, {SEC_ACLE_GROUP, "", "staff", 0x3}});
     // Only blanks are skipped: a second separator leaves an empty token,
     // which cannot stand for a mechanism or an identity.
-    expect_line_error("u unix\xa0\xa0joe", 158, SEC_S_BAD_ACL);
+    expect_line({"u unix\xa0\xa0joe", SEC_S_BAD_ACL, {}, MSG_2650_172, {1}});
 
     ASSERT_NE(std::setlocale(LC_ALL, "C"), nullptr);
-    expect_token_error(line, 165, SEC_S_BAD_ACL, line);
+    expect_line({line.c_str(), SEC_S_BAD_ACL, {}, MSG_2650_179, {1, line}});
 }
 
 } // namespace

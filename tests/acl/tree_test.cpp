@@ -1,4 +1,7 @@
-// Entry trees: order, duplicates, the array of trees.
+// Entry trees: identities that share their first bytes, many identities,
+// the array of trees and the buffer it makes. The order of entries and the
+// refusal or merging of duplicates show through listing and editing
+// (buffers_test).
 #include <cstdio>
 #include <string>
 #include <vector>
@@ -34,19 +37,6 @@ struct owned_tree {
     }
 };
 
-TEST(Acltree, UserAndGroupByIdentityExpandedAsAdded) {
-    owned_tree user, group, expanded;
-    for (const char *id : {"c", "a", "B"})
-        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
-    for (const char *id : {"wheel", "Staff", "_x", "Zeta"})
-        ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 2, "", id}), SEC_S_OK);
-    for (const char *id : {"z", "a", "m"})
-        ASSERT_EQ(expanded.add(1, {SEC_ACLE_EXPANDED, 3, "unix", id}), SEC_S_OK);
-    EXPECT_EQ(user.walked(), (texts{"a/1", "B/1", "c/1"}));
-    EXPECT_EQ(group.walked(), (texts{"_x/2", "Staff/2", "wheel/2", "Zeta/2"}));
-    EXPECT_EQ(expanded.walked(), (texts{"z/3", "a/3", "m/3"}));
-}
-
 // Nodes order by the first eight folded bytes and only then by the rest:
 // identities that share those bytes, or end within them, still order and
 // collide exactly as the comparison says.
@@ -65,28 +55,8 @@ TEST(Acltree, IdentitiesSharingTheirFirstEightBytes) {
     EXPECT_EQ(user.walked().size(), 6u);
 }
 
-TEST(Acltree, DuplicatesRefusedOrMerged) {
-    owned_tree user, group, anyother;
-    ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "Alice"}), SEC_S_OK);
-    EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 2, "UNIX", "alice"}), SEC_S_BAD_ACLE);
-    error_record e = expect_error(SEC_S_BAD_ACLE, MSG_2650_157);
-    EXPECT_EQ(e.num(0), 'u');
-    EXPECT_EQ(e.str(1) + " " + e.str(2), "UNIX alice");
-    EXPECT_EQ(user.walked(), texts{"Alice/1"});
-    EXPECT_EQ(user.add(0, {SEC_ACLE_USER, 2, "unix", "alice"}), SEC_S_OK);
-    EXPECT_EQ(user.walked(), texts{"Alice/2"});
-
-    ASSERT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "staff"}), SEC_S_OK);
-    EXPECT_EQ(group.add(1, {SEC_ACLE_GROUP, 1, "", "Staff"}), SEC_S_BAD_ACLE);
-    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_175).str(1), "Staff");
-
-    ASSERT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 1}), SEC_S_OK);
-    EXPECT_EQ(anyother.add(1, {SEC_ACLE_ANYOTHER, 4}), SEC_S_BAD_ACLE);
-    EXPECT_EQ(expect_error(SEC_S_BAD_ACLE, MSG_2650_174).num(0), 'o');
-    EXPECT_EQ(anyother.add(0, {SEC_ACLE_ANYOTHER, 4}), SEC_S_OK);
-    EXPECT_EQ(anyother.walked(), texts{"-/4"});
-}
-
+// One tree per key in order of first occurrence; the worked example and the
+// ACL of no trees, byte for byte.
 TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
     owned_trees trees;
     ASSERT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
@@ -102,6 +72,12 @@ TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
                         make_subacl(4, 2, text_field("unix"),
                                     {make_record(1, text_field("alice")),
                                      make_record(3, text_field("bob"))})}));
+    EXPECT_EQ(build_acl({{SEC_ACLE_USER, 0x3, "unix", "bob"},
+                         {SEC_ACLE_GROUP, 0x1, "", "staff"},
+                         {SEC_ACLE_ANYOTHER, 0x1}}),
+              worked_example);
+    EXPECT_EQ(build_acl({}), empty_acl_bytes);
+    EXPECT_EQ(swapped_order(worked_example), worked_example_swapped); // the tests' own helper
 }
 
 // The number of entries that a walk of t gives, expecting each identity to
@@ -117,33 +93,27 @@ int walked_in_ascending_order(sec_acltree_t t) {
     return seen;
 }
 
-TEST(Acltree, SortedInsertionOfManyIdentities) {
-    constexpr int count = 200000;
-    owned_tree user;
+// Many identities, in order and shuffled: the walk gives them all in order,
+// and a repeat in another case is refused.
+TEST(Acltree, ManyIdentities) {
+    constexpr int count = 100000;
+    owned_tree sorted, shuffled;
     char id[16];
     for (int i = 0; i < count; ++i) {
         std::snprintf(id, sizeof id, "u%07d", i);
-        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
+        ASSERT_EQ(sorted.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
+        std::snprintf(id, sizeof id, "user-%d", i * 7919 % count); // a permutation
+        ASSERT_EQ(shuffled.add(1, {SEC_ACLE_USER, 1, "unix", id}), SEC_S_OK);
     }
-    EXPECT_EQ(walked_in_ascending_order(user.t), count);
-    EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", "U0199999"}), SEC_S_BAD_ACLE);
-}
-
-TEST(Acltree, ShuffledInsertionOfManyIdentities) {
-    constexpr int count = 50000;
-    std::vector<std::string> ids;
-    for (int i = 0; i < count; ++i)
-        ids.push_back("user-" + std::to_string(i * 7919 % count)); // a permutation
-    owned_tree user;
-    for (const std::string &id : ids)
-        ASSERT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", id.c_str()}), SEC_S_OK);
-    EXPECT_EQ(walked_in_ascending_order(user.t), count);
-    for (const char *again : {"USER-0", "User-49999", "user-25000"})
-        EXPECT_EQ(user.add(1, {SEC_ACLE_USER, 1, "unix", again}), SEC_S_BAD_ACLE) << again;
+    EXPECT_EQ(walked_in_ascending_order(sorted.t), count);
+    EXPECT_EQ(walked_in_ascending_order(shuffled.t), count);
+    for (const char *again : {"USER-0", "User-99999", "user-25000"})
+        EXPECT_EQ(shuffled.add(1, {SEC_ACLE_USER, 1, "unix", again}), SEC_S_BAD_ACLE) << again;
+    EXPECT_EQ(sorted.add(1, {SEC_ACLE_USER, 1, "unix", "U0099999"}), SEC_S_BAD_ACLE);
     entry gone{SEC_ACLE_USER, 0, "unix", "USER-12345"};
-    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_OK);
-    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), user.t), SEC_S_ACLE_NOT_FOUND);
-    EXPECT_EQ(tree_entry_count(user.t), static_cast<std::size_t>(count - 1));
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), shuffled.t), SEC_S_OK);
+    EXPECT_EQ(sec__del_acle_from_tree(gone.p(), shuffled.t), SEC_S_ACLE_NOT_FOUND);
+    EXPECT_EQ(tree_entry_count(shuffled.t), static_cast<std::size_t>(count - 1));
 }
 
 TEST(AllocationFailure, AddAcleToTrees) {
@@ -173,6 +143,24 @@ TEST(AllocationFailure, AddAcleToTrees) {
                   }),
                   c.allocations);
     }
+}
+
+TEST(AllocationFailure, AcltreesToAcl) {
+    owned_trees trees;
+    ASSERT_EQ(trees.add({SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_OK);
+    ASSERT_EQ(trees.add({SEC_ACLE_GROUP, 0x1, "", "staff"}), SEC_S_OK);
+    EXPECT_GE(for_each_allocation_failure([&](long n) {
+                  owned_acl acl;
+                  kx_int32_t rc = failing_after(
+                      n, [&] { return sec__acltrees_to_acl(trees.trees, trees.count, acl.get()); });
+                  if (rc != SEC_S_OK) {
+                      expect_no_memory(rc, {"sec__acltrees_to_acl", "sec__acltree_to_subacl",
+                                            "sec__add_acle_to_subacl"});
+                      EXPECT_EQ(acl.d.value, nullptr);
+                  }
+                  return rc;
+              }),
+              1);
 }
 
 } // namespace

@@ -1,0 +1,673 @@
+// Every exported function in two tables: its calls with bad arguments, each
+// with the exact status, message and arguments, and the outputs it leaves
+// alone; and the API trace points its calls record at each API level. Each
+// TEST runs in a process of its own, so the levels set before its first
+// library call are the ones that trace registration reads.
+#include <cerrno>
+#include <climits>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include <kx_acl.h>
+#include <kx_tr.h>
+
+#include "acl_fixtures.h"
+#include "eval.h"
+#include "file_helpers.h"
+#include "report.h"
+
+using namespace kxacl;
+using namespace kxtest;
+
+namespace {
+
+// ---- bad arguments ---------------------------------------------------------
+
+constexpr kx_uint32_t mark = 0xdeadbeef;
+template <typename T> T marked() {
+    return reinterpret_cast<T>(8);
+}
+
+// The outputs of the calls, set to marks before each row.
+struct outputs {
+    sec_acle_t acle = marked<sec_acle_t>();
+    char *mech = marked<char *>(), *id = marked<char *>();
+    kx_uint32_t perm = mark, rflags = mark;
+    sec_acle_list_s list{5, marked<sec_acle_t *>()};
+    sec_buffer_s acl{7, marked<void *>()}; // passed only where it is not read
+    bool untouched() const {
+        return acle == marked<sec_acle_t>() && mech == marked<char *>() && id == marked<char *>() &&
+               perm == mark && rflags == mark && list.count == 5 &&
+               list.acles == marked<sec_acle_t *>() && acl.length == 7 &&
+               acl.value == marked<void *>();
+    }
+};
+
+// A pointer as 2650-101 shows it: its low 32 bits.
+long long shown(const void *p) {
+    return static_cast<int>(pointer_value(p));
+}
+
+struct refusal {
+    const char *call;
+    kx_int32_t status;
+    int msg;
+    std::vector<arg> args;
+    std::function<kx_int32_t(outputs &)> run;
+    std::function<void(const outputs &)> left = nullptr; // else: every output untouched
+};
+
+unsigned char *data_of(const bytes &b) {
+    return const_cast<unsigned char *>(b.data());
+}
+
+kx_int32_t single(sec_acl_buffer_t acl, unsigned char type, const char *mech, const char *id,
+                  kx_uint32_t *perm) {
+    return sec__single_acle_perm(acl, type, const_cast<char *>(mech), nullptr,
+                                 const_cast<char *>(id), perm);
+}
+
+// An edit of a copy of b that must leave the copy as it was.
+kx_int32_t edit_of(kx_int32_t (*edit)(sec_acle_t, sec_acl_buffer_t), entry e, const bytes &b) {
+    owned_acl acl(b);
+    kx_int32_t rc = edit(e.p(), acl.get());
+    EXPECT_EQ(acl.contents(), b);
+    return rc;
+}
+
+kx_int32_t never_called(char *, char *) {
+    return 0;
+}
+
+std::vector<refusal> refusals() {
+    static owned_acl good(worked_example);
+    static bytes bad_type = worked_example, bad_version = worked_example;
+    bad_type[0] = 0x84;
+    bad_version[1] = 2;
+    static owned_acl foreign(worked_example_swapped), typeless(bad_type), unversioned(bad_version),
+        cut(bytes(worked_example.begin(), worked_example.begin() + 4));
+    static sec_buffer_s empty{0, nullptr}, no_value{71, nullptr};
+    static char long_mech[] = "0123456789abcdefg", nothing[] = "", no_at[] = "bob",
+                no_host[] = "bob@", unix_mech[] = "unix";
+    const std::string reg = "acl__register_id_handler", one = "sec__single_acle_perm",
+                      groups = "sec__group_acles_perm";
+
+    // clang-format off
+    std::vector<refusal> rows = {
+        {"translate_perms: no result", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_translate_perms", 3, 0},
+         [](outputs &) { return sec_translate_perms("r", nullptr, nullptr); }},
+        {"translate_perms: earlier bits stay", SEC_S_BAD_PERMISSION, MSG_2650_146, {'z'},
+         [](outputs &o) { return sec_translate_perms("rwz", nullptr, &o.perm); },
+         [](const outputs &o) {
+             EXPECT_EQ(o.perm, 0x3u);
+             EXPECT_NE(last_error().text.find("permission ('z') does not"), std::string::npos);
+         }},
+        {"translate_perms: case counts", SEC_S_BAD_PERMISSION, MSG_2650_146, {'R'},
+         [](outputs &o) { return sec_translate_perms("R", nullptr, &o.perm); },
+         [](const outputs &o) { EXPECT_EQ(o.perm, 0u); }},
+        {"translate_bitmask: no result", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_translate_mask", 3, 0},
+         [](outputs &) { return sec_translate_bitmask(1, nullptr, nullptr); }},
+        {"translate_bitmask: bit 13", SEC_S_BAD_PERMISSION, MSG_2650_178, {0x2000},
+         [](outputs &) { char out[33]; return sec_translate_bitmask(0x2000, nullptr, out); },
+         [](const outputs &) {
+             EXPECT_NE(last_error().text.find("(0x00002000)"), std::string::npos);
+         }},
+        {"translate_bitmask: lowest bit without template", SEC_S_BAD_PERMISSION, MSG_2650_178,
+         {INT_MIN},
+         [](outputs &) { char out[33]; return sec_translate_bitmask(0x80000001u, nullptr, out); }},
+        {"create_acle: type", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 1, 3},
+         [](outputs &o) { return sec_create_acle(3, 0, "unix", "a@b", &o.acle); }},
+        {"create_acle: long mech", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_create_acle", 3, shown(long_mech)},
+         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 0, long_mech, "a@b", &o.acle); }},
+        {"create_acle: no mech", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 3, 0},
+         [](outputs &o) { return sec_create_acle(SEC_ACLE_EXPANDED, 0, nullptr, "x", &o.acle); }},
+        {"create_acle: empty id", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_create_acle", 4, shown(nothing)},
+         [](outputs &o) { return sec_create_acle(SEC_ACLE_GROUP, 0, nullptr, nothing, &o.acle); }},
+        {"create_acle: no result", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 5, 0},
+         [](outputs &) { return sec_create_acle(SEC_ACLE_GROUP, 0, nullptr, "g", nullptr); }},
+        // A unix or vgn2 user's identity needs a host part: no entry is handed out.
+        {"create_acle: unix user without host", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_create_acle", 4, shown(no_at)},
+         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 1, "unix", no_at, &o.acle); },
+         [](const outputs &o) { EXPECT_EQ(o.acle, nullptr); }},
+        {"create_acle: vgn2 user, empty host", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_create_acle", 4, shown(no_host)},
+         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 1, "vgn2", no_host, &o.acle); },
+         [](const outputs &o) { EXPECT_EQ(o.acle, nullptr); }},
+        {"display_acle_id: no entry", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_display_acle_id", 1, 0},
+         [](outputs &o) { return sec_display_acle_id(nullptr, &o.mech, &o.id); }},
+        {"display_acle_id: no mech result", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_display_acle_id", 2, 0},
+         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), nullptr, &o.id); }},
+        {"display_acle_id: no id result", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_display_acle_id", 3, 0},
+         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), &o.mech, nullptr); }},
+        // Past the argument checks, a failure leaves both outputs null.
+        {"display_acle_id: type 7", SEC_S_BAD_ACLE, MSG_2650_107, {7},
+         [](outputs &o) { entry e{7, 1}; return sec_display_acle_id(e.p(), &o.mech, &o.id); },
+         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
+        {"display_acle_id: group, empty id", SEC_S_BAD_ACLE, MSG_2650_108, {},
+         [](outputs &o) {
+             entry e{SEC_ACLE_GROUP, 1, "", ""};
+             return sec_display_acle_id(e.p(), &o.mech, &o.id);
+         },
+         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
+        {"display_acle_id: user without mech", SEC_S_BAD_ACLE, MSG_2650_108, {},
+         [](outputs &o) {
+             entry e{SEC_ACLE_USER, 1, "", "joe"};
+             return sec_display_acle_id(e.p(), &o.mech, &o.id);
+         },
+         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
+        {"create_empty_acl: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_create_empty_acl", 1, 0},
+         [](outputs &) { return sec_create_empty_acl(nullptr); }},
+        {"read_acl_from_data: length 0", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_read_acl_from_data", 1, 0},
+         [](outputs &o) { return sec_read_acl_from_data(0, data_of(worked_example), &o.acl); }},
+        {"read_acl_from_data: length -1", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_read_acl_from_data", 1, -1},
+         [](outputs &o) { return sec_read_acl_from_data(-1, data_of(worked_example), &o.acl); }},
+        {"read_acl_from_data: no bytes", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_read_acl_from_data", 2, 0},
+         [](outputs &o) { return sec_read_acl_from_data(5, nullptr, &o.acl); }},
+        {"read_acl_from_data: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_read_acl_from_data", 3, 0},
+         [](outputs &) { return sec_read_acl_from_data(5, data_of(worked_example), nullptr); }},
+        {"convert_acl_to_host: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_convert_acl_to_host", 1, 0},
+         [](outputs &) { return sec_convert_acl_to_host(1, nullptr); }},
+        // Bytes that are no ACL buffer are not freed (owned_acl frees them).
+        {"release_acl: no ACL buffer", SEC_S_BAD_ACL, MSG_2650_106, {},
+         [](outputs &) {
+             owned_acl acl(bad_type);
+             void *value = acl.d.value;
+             kx_int32_t rc = sec_release_acl(acl.get());
+             EXPECT_TRUE(acl.d.value == value && acl.d.length == 71);
+             return rc;
+         }},
+        {"list_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl", 1, 0},
+         [](outputs &o) { return sec_list_acl(nullptr, &o.list); }},
+        {"list_acl: no list", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl", 2, 0},
+         [](outputs &) { return sec_list_acl(good.get(), nullptr); }},
+        {"list_acl: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
+         [](outputs &o) { return sec_list_acl(foreign.get(), &o.list); }},
+        {"list_acl: length without bytes", SEC_S_BAD_ACL, MSG_2650_109, {},
+         [](outputs &o) { return sec_list_acl(&no_value, &o.list); }},
+        {"list_acl_by_type: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 1, 0},
+         [](outputs &o) { return sec_list_acl_by_type(nullptr, 4, nullptr, &o.list); }},
+        {"list_acl_by_type: type 3", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 2, 3},
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 3, nullptr, &o.list); }},
+        {"list_acl_by_type: handler bit", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_list_acl_by_type", 2, 0x84},
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 0x84, nullptr, &o.list); }},
+        {"list_acl_by_type: empty mech", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_list_acl_by_type", 3, shown(nothing)},
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 4, nothing, &o.list); }},
+        {"list_acl_by_type: long mech", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_list_acl_by_type", 3, shown(long_mech)},
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 8, long_mech, &o.list); }},
+        {"list_acl_by_type: no list", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 4, 0},
+         [](outputs &) { return sec_list_acl_by_type(good.get(), 16, nullptr, nullptr); }},
+        {"list_acl_by_type: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
+         [](outputs &o) { return sec_list_acl_by_type(foreign.get(), 4, nullptr, &o.list); }},
+        {"add_acle_to_acl: no entry", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_add_acle_to_acl", 1, 0},
+         [](outputs &) { return sec_add_acle_to_acl(nullptr, good.get()); }},
+        {"add_acle_to_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_add_acle_to_acl", 2, 0},
+         [](outputs &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), nullptr); }},
+        {"add_acle_to_acl2: no entry, same routine", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_add_acle_to_acl", 1, 0},
+         [](outputs &) { return sec_add_acle_to_acl2(nullptr, good.get()); }},
+        {"add_acle_to_acl: type 3", SEC_S_BAD_ACLE, MSG_2650_116, {3},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {3, 1}, worked_example); }},
+        {"add_acle_to_acl: user without mech", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_USER},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {4, 1, "", "bob"}, worked_example); }},
+        {"add_acle_to_acl2: mech filling its field", SEC_S_BAD_ACLE, MSG_2650_117,
+         {SEC_ACLE_EXPANDED},
+         [](outputs &) {
+             entry e{SEC_ACLE_EXPANDED, 1, "", "x*"};
+             std::memset(e.desc.mech, 'm', sizeof e.desc.mech);
+             return edit_of(sec_add_acle_to_acl2, e, worked_example);
+         }},
+        {"add_acle_to_acl: group without id", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_GROUP},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {16, 1}, worked_example); }},
+        {"add_acle_to_acl: buffer type", SEC_S_BAD_ACL, MSG_2650_113, {},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, bad_type); }},
+        {"add_acle_to_acl: version", SEC_S_BAD_ACL, MSG_2650_114, {},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, bad_version); }},
+        {"add_acle_to_acl: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
+         [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, worked_example_swapped); }},
+        {"add_acle_to_acl: length without bytes", SEC_S_BAD_ACL, MSG_2650_106, {},
+         [](outputs &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), &no_value); }},
+        {"del_acle_from_acl: no entry", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_del_acle_from_acl", 1, 0},
+         [](outputs &) { return sec_del_acle_from_acl(nullptr, good.get()); }},
+        {"del_acle_from_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101,
+         {"sec_del_acle_from_acl", 2, 0},
+         [](outputs &) { entry e{2, 1}; return sec_del_acle_from_acl(e.p(), nullptr); }},
+        {"del_acle_from_acl: type 32", SEC_S_BAD_ACLE, MSG_2650_116, {32},
+         [](outputs &) { return edit_of(sec_del_acle_from_acl, {32, 1}, worked_example); }},
+        {"del_acle_from_acl: expanded, no id", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_EXPANDED},
+         [](outputs &) { return edit_of(sec_del_acle_from_acl, {8, 1, "unix"}, worked_example); }},
+        {"del_acle_from_acl: the empty ACL", SEC_S_BAD_ACL, MSG_2650_106, {},
+         [](outputs &) { return edit_of(sec_del_acle_from_acl, {2, 1}, {}); }},
+        {"del_acle_from_acl: buffer type", SEC_S_BAD_ACL, MSG_2650_113, {},
+         [](outputs &) { return edit_of(sec_del_acle_from_acl, {2, 1}, bad_type); }},
+        // The ACL is left alone and the flags are handed back as they came.
+        {"read_acl_file: no file name", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 1, 0},
+         [](outputs &o) {
+             return sec_read_acl_file(nullptr, nullptr, nullptr, 0x105, &o.acl, &o.rflags);
+         },
+         [](const outputs &o) { EXPECT_TRUE(o.rflags == 0x105 && o.acl.length == 7); }},
+        {"read_acl_file: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 5, 0},
+         [](outputs &o) { return sec_read_acl_file("acl", nullptr, nullptr, 2, nullptr, &o.rflags);
+         },
+         [](const outputs &o) { EXPECT_EQ(o.rflags, 2u); }},
+        {"read_acl_file: empty user name", SEC_S_BAD_PARAM, MSG_2650_134, {},
+         [](outputs &o) { return sec_read_acl_file("acl", "", nullptr, 3, &o.acl, &o.rflags); },
+         [](const outputs &o) { EXPECT_TRUE(o.rflags == 3 && o.acl.length == 7); }},
+        {"register_id_handler: type 0", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 1, 0},
+         [](outputs &) { return sec__register_id_handler(0, nullptr, nullptr); }},
+        {"register_id_handler: type 3", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 1, 3},
+         [](outputs &) { return sec__register_id_handler(3, "", never_called); }},
+        {"register_id_handler: no mech", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 2, 0},
+         [](outputs &) { return sec__register_id_handler(1, nullptr, nullptr); }},
+        {"register_id_handler: no handler", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 3, 0},
+         [](outputs &) { return sec__register_id_handler(1, "", nullptr); }},
+        {"register_id_handler: long mech", SEC_S_BAD_PARAM, MSG_2650_132, {},
+         [](outputs &) { return sec__register_id_handler(2, long_mech, never_called); }},
+        {"register_id_handler: empty mech", SEC_S_BAD_PARAM, MSG_2650_132, {},
+         [](outputs &) { return sec__register_id_handler(2, "", never_called); }},
+        {"single_acle_perm: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {one, 1, 0},
+         [](outputs &o) { return single(nullptr, 4, "unix", "bob", &o.perm); }},
+        {"single_acle_perm: no result", SEC_S_BAD_PARAM, MSG_2650_101, {one, 6, 0},
+         [](outputs &) { return single(good.get(), 16, nullptr, nullptr, nullptr); }},
+        {"group_acles_perm: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 1, 0},
+         [](outputs &o) { return sec__group_acles_perm(nullptr, 0, nullptr, &o.perm); }},
+        {"group_acles_perm: no groups", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 3, 0},
+         [](outputs &o) { return sec__group_acles_perm(good.get(), 1, nullptr, &o.perm); }},
+        {"group_acles_perm: count -1", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 3, 0},
+         [](outputs &o) { return sec__group_acles_perm(good.get(), -1, nullptr, &o.perm); }},
+        {"group_acles_perm: no result", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 4, 0},
+         [](outputs &) { return sec__group_acles_perm(good.get(), 0, nullptr, nullptr); }},
+    };
+
+    // Header faults come before the other arguments in both evaluations (a
+    // refused type, no groups) and refuse conversion too, except a cut
+    // buffer and one of the other order, which convert without validation.
+    for (auto [acl, m, converts] : {std::tuple{&empty, MSG_2650_109, false},
+                                    {&no_value, MSG_2650_109, false},
+                                    {cut.get(), MSG_2650_109, true},
+                                    {typeless.get(), MSG_2650_109, false},
+                                    {unversioned.get(), MSG_2650_109, false},
+                                    {foreign.get(), MSG_2650_115, true}}) {
+        rows.push_back({"single_acle_perm: header", SEC_S_BAD_ACL, m, {}, [acl](outputs &o) {
+                            return single(acl, 16, nullptr, nullptr, &o.perm);
+                        }});
+        rows.push_back({"group_acles_perm: header", SEC_S_BAD_ACL, m, {}, [acl](outputs &o) {
+                            return sec__group_acles_perm(acl, 0, nullptr, &o.perm);
+                        }});
+        if (!converts)
+            rows.push_back({"convert_acl_to_host: header", SEC_S_BAD_ACL, MSG_2650_109, {},
+                            [acl](outputs &) { return sec_convert_acl_to_host(0, acl); }});
+    }
+    // The type is shown as its whole byte; user and expanded requests need
+    // a mechanism, then an identity.
+    for (unsigned type : {0u, 3u, 16u, 0x90u, 0x9fu, 0xe0u})
+        rows.push_back({"single_acle_perm: type", SEC_S_BAD_PARAM, MSG_2650_128, {type},
+                        [type](outputs &o) {
+                            auto t = static_cast<unsigned char>(type);
+                            return single(good.get(), t, "unix", "bob", &o.perm);
+                        }});
+    for (unsigned char type : {4, 8, 0x84})
+        for (const char *none : {static_cast<const char *>(nullptr), ""}) {
+            rows.push_back({"single_acle_perm: mech", SEC_S_BAD_PARAM, MSG_2650_129, {},
+                            [=](outputs &o) {
+                                char *mech = const_cast<char *>(none);
+                                return sec__single_acle_perm(good.get(), type, mech, unix_mech,
+                                                             nullptr, &o.perm);
+                            }});
+            rows.push_back({"single_acle_perm: id", SEC_S_BAD_PARAM, MSG_2650_130, {},
+                            [=](outputs &o) {
+                                return single(good.get(), type, "unix", none, &o.perm);
+                            }});
+        }
+    // clang-format on
+    return rows;
+}
+
+TEST(ApiTable, BadArguments) {
+    for (const refusal &r : refusals()) {
+        SCOPED_TRACE(r.call);
+        outputs o;
+        EXPECT_EQ(r.run(o), r.status);
+        EXPECT_TRUE(record_is(r.status, r.msg, r.args));
+        if (r.left)
+            r.left(o);
+        else
+            EXPECT_TRUE(o.untouched());
+    }
+    // Refused registrations registered nothing.
+    for (auto [type, mech] : {std::pair{SEC_ID_HANDLER_USER, "0123456789abcdefg"},
+                              {SEC_ID_HANDLER_USER, ""},
+                              {SEC_ID_HANDLER_EXPANDED, ""}}) {
+        sec_acl_id_handler h = never_called;
+        sec__get_id_handler(type, mech, &h);
+        EXPECT_EQ(h, nullptr) << mech;
+    }
+}
+
+// ---- API trace points ------------------------------------------------------
+
+std::string described(unsigned id, const std::vector<std::string> &items) {
+    std::string s = std::to_string(id) + ":";
+    for (const std::string &i : items)
+        s += " " + (i.empty() ? std::string("-") : i);
+    return s;
+}
+
+// The records a call must leave at API level 8, as "id: items".
+struct expected {
+    std::vector<std::string> records;
+    void at(unsigned id, const std::vector<std::string> &items = {}) {
+        records.push_back(described(id, items));
+    }
+};
+
+// Trace items: numbers of 1 and 4 bytes, pointers, texts.
+std::string u8(std::uint8_t v) {
+    return hex_of(v);
+}
+std::string u32(kx_uint32_t v) {
+    return hex_of(v);
+}
+std::string i32(kx_int32_t v) {
+    return hex_of(v);
+}
+std::string ptr(const void *p) {
+    return hex_of(p);
+}
+std::string txt(const std::string &s) {
+    return hex_text(s);
+}
+
+// What the traced calls share; made before the first library call.
+struct world {
+    owned_acl acl, from_file, empty;
+    sec_acle_t acle = nullptr;
+    owned_list list, typed;
+    entry carol{SEC_ACLE_USER, 7, "unix", "carol"};
+    acl_dir dir{"o r\n# c\ng staff rw\n"};
+    kx_uint32_t perm = 0, rflags = 0;
+    char text[33] = {}, unix_mech[5] = "unix", staff[6] = "staff";
+    sec_buffer_s groups[1] = {{6, staff}};
+    char *mech = nullptr, *id = nullptr;
+    ~world() {
+        std::free(mech);
+        std::free(id);
+    }
+};
+
+kx_int32_t handler(char *, char *) {
+    return 0;
+}
+
+// The entry items of the edits: carol's entry, then the ACL's descriptor.
+std::vector<std::string> edit_items(world &w) {
+    return {ptr(w.carol.p()),
+            u32(4),
+            u32(7),
+            txt("unix"),
+            txt("carol"),
+            ptr(w.acl.get()),
+            i32(w.acl.d.length),
+            ptr(w.acl.d.value)};
+}
+
+// One call: the bare ids it records at API level 1 (none: 0), whether it
+// clears the error record on entry, whether it is a release (whose exit is
+// recorded at every level but 0); run makes it and states its level-8 records.
+enum call_kind { keeps = 0, clears = 1, release = 2 };
+struct traced_call {
+    const char *call;
+    unsigned enter, exit;
+    int kind;
+    std::function<kx_int32_t(world &, expected &)> run;
+};
+
+constexpr kx_int32_t ok = SEC_S_OK;
+
+std::vector<traced_call> traced_calls() {
+    // clang-format off
+    return {
+        {"sec_translate_perms failing", 91, 94, keeps, [](world &w, expected &x) {
+             x.at(93, {txt("rz"), ptr(nullptr), ptr(&w.perm)});
+             x.at(95, {i32(SEC_S_BAD_PERMISSION)});
+             return sec_translate_perms("rz", nullptr, &w.perm); }},
+        {"sec_translate_perms of no text", 91, 94, keeps, [](world &w, expected &x) {
+             x.at(93, {txt("<nil>"), ptr(nullptr), ptr(&w.perm)}), x.at(96, {i32(ok), u32(0)});
+             return sec_translate_perms(nullptr, nullptr, &w.perm); }},
+        {"sec_translate_bitmask", 97, 100, keeps, [](world &w, expected &x) {
+             x.at(99, {u32(3), ptr(nullptr), ptr(w.text)}), x.at(102, {i32(ok), txt("rw")});
+             return sec_translate_bitmask(3, nullptr, w.text); }},
+        {"sec_create_acle", 40, 43, clears, [](world &w, expected &x) {
+             x.at(42, {u32(4), u32(3), txt("unix"), txt("bob@host"), ptr(&w.acle)});
+             x.at(44, {i32(ok)});
+             return sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@host", &w.acle); }},
+        {"sec_display_acle_id", 49, 52, clears, [](world &w, expected &x) {
+             x.at(51, {ptr(w.acle), u32(4), u32(3), txt("unix"), txt("bob@host"), ptr(&w.mech),
+                       ptr(&w.id)});
+             x.at(54, {i32(ok), txt("unix"), txt("bob@host")});
+             return sec_display_acle_id(w.acle, &w.mech, &w.id); }},
+        {"sec_release_acle", 45, 48, release, [](world &w, expected &x) {
+             x.at(47, {ptr(w.acle), u8(4), u32(3), txt("unix"), txt("bob@host")}), x.at(48);
+             sec_release_acle(w.acle);
+             return ok; }},
+        // A null entry records as a zeroed one.
+        {"sec_release_acle of none", 45, 48, release, [](world &, expected &x) {
+             x.at(47, {ptr(nullptr), u8(0), u32(0), txt(""), txt("")}), x.at(48);
+             sec_release_acle(nullptr);
+             return ok; }},
+        {"sec_create_empty_acl records nothing", 0, 0, keeps, [](world &w, expected &) {
+             return sec_create_empty_acl(w.empty.get()); }},
+        {"sec_read_acl_from_data", 15, 18, clears, [](world &w, expected &x) {
+             auto *b = const_cast<unsigned char *>(worked_example.data());
+             x.at(17, {i32(71), ptr(b), ptr(w.acl.get())}), x.at(19, {i32(ok)});
+             return sec_read_acl_from_data(71, b, w.acl.get()); }},
+        {"sec_convert_acl_to_host", 55, 58, clears, [](world &w, expected &x) {
+             x.at(57, {u32(1), ptr(w.acl.get()), i32(71), ptr(w.acl.d.value)}), x.at(59, {i32(ok)});
+             return sec_convert_acl_to_host(1, w.acl.get()); }},
+        {"sec_list_acl", 20, 25, clears, [](world &w, expected &x) {
+             x.at(24, {i32(71), ptr(w.acl.d.value), ptr(w.list.get())});
+             x.at(27, {i32(ok), i32(3)});
+             return sec_list_acl(w.acl.get(), w.list.get()); }},
+        {"sec_list_acl of no ACL", 20, 25, clears, [](world &w, expected &x) {
+             x.at(22, {ptr(nullptr), ptr(w.typed.get())}), x.at(26, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl(nullptr, w.typed.get()); }},
+        {"sec_list_acl_by_type", 28, 33, clears, [](world &w, expected &x) {
+             x.at(32, {i32(71), ptr(w.acl.d.value), u32(16), txt(""), ptr(w.typed.get())});
+             x.at(35, {i32(ok), i32(1)});
+             return sec_list_acl_by_type(w.acl.get(), SEC_ACLE_GROUP, nullptr, w.typed.get()); }},
+        {"sec_list_acl_by_type of no ACL", 28, 33, clears, [](world &w, expected &x) {
+             x.at(30, {ptr(nullptr), u32(4), txt("unix"), ptr(w.list.get())});
+             x.at(34, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl_by_type(nullptr, SEC_ACLE_USER, w.unix_mech, w.list.get()); }},
+        {"sec_release_aclelist", 36, 39, release, [](world &w, expected &x) {
+             x.at(38, {ptr(w.list.get()), i32(3)}), x.at(39);
+             sec_release_aclelist(w.list.get());
+             return ok; }},
+        {"sec_add_acle_to_acl", 60, 63, clears, [](world &w, expected &x) {
+             x.at(62, edit_items(w));
+             x.at(64, {i32(ok)});
+             return sec_add_acle_to_acl(w.carol.p(), w.acl.get()); }},
+        {"sec_add_acle_to_acl2 refusing", 60, 63, clears, [](world &w, expected &x) {
+             x.at(62, edit_items(w));
+             x.at(64, {i32(SEC_S_BAD_ACLE)});
+             return sec_add_acle_to_acl2(w.carol.p(), w.acl.get()); }},
+        {"sec_del_acle_from_acl", 65, 68, clears, [](world &w, expected &x) {
+             x.at(67, edit_items(w));
+             x.at(69, {i32(ok)});
+             return sec_del_acle_from_acl(w.carol.p(), w.acl.get()); }},
+        {"sec__register_id_handler", 74, 77, clears, [](world &, expected &x) {
+             sec_acl_id_handler h = handler;
+             x.at(76, {u32(SEC_ID_HANDLER_USER), txt("unix"), hex_of(h)}), x.at(78, {i32(ok)});
+             return sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler); }},
+        {"sec__single_acle_perm", 79, 82, clears, [](world &w, expected &x) {
+             x.at(81, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), u32(4), txt("unix"),
+                       txt("bob"), ptr(&w.perm)});
+             x.at(84, {i32(ok), u32(3)});
+             return single(w.acl.get(), SEC_ACLE_USER, "unix", "bob", &w.perm); }},
+        {"sec__single_acle_perm refusing", 79, 82, clears, [](world &w, expected &x) {
+             x.at(81, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), u32(8), txt("unix"),
+                       txt("bob"), ptr(&w.perm)});
+             x.at(83, {i32(SEC_S_BAD_ACLE)});
+             return single(w.acl.get(), SEC_ACLE_EXPANDED, "unix", "bob", &w.perm); }},
+        {"sec__group_acles_perm", 85, 88, clears, [](world &w, expected &x) {
+             x.at(87, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value), i32(1), ptr(w.groups),
+                       ptr(&w.perm)});
+             x.at(90, {i32(ok), u32(1)});
+             return sec__group_acles_perm(w.acl.get(), 1, w.groups, &w.perm); }},
+        // The exit carries the line reached.
+        {"sec_read_acl_file", 9, 12, clears, [](world &w, expected &x) {
+             x.at(11, {txt(w.dir.acl), txt(""), ptr(nullptr), u32(TEXT), ptr(w.from_file.get())});
+             x.at(14, {i32(ok), i32(4)});
+             return sec_read_acl_file(w.dir.acl.c_str(), nullptr, nullptr, TEXT, w.from_file.get(),
+                                      &w.rflags); }},
+        {"sec_release_acl", 70, 73, clears | release, [](world &w, expected &x) {
+             x.at(72, {ptr(w.acl.get()), i32(71), ptr(w.acl.d.value)}), x.at(73);
+             return sec_release_acl(w.acl.get()); }},
+    };
+    // clang-format on
+}
+
+std::vector<unsigned> ids_of(const std::vector<trace_record> &records) {
+    std::vector<unsigned> ids;
+    for (const trace_record &r : records)
+        ids.push_back(r.id);
+    return ids;
+}
+
+// Every traced call at API levels 8, 1, 4 and 0: at 8 the records with
+// their data, at 1 the bare entry and exit, at 4 only a release's exit, at
+// 0 nothing. A success leaves the caller's record, or none when the call
+// clears it. Perf 5 is not announced.
+TEST(ApiTrace, EveryLevel) {
+    std::string file = start_tracing("_SEL:API=8,Perf=5");
+    for (tr_detail_level_t level : {8, 1, 4, 0}) {
+        if (level != 8) { // the component registered at the first call
+            ASSERT_EQ(tr_set_detail_level_1("_SEL", "API", level), TR_OK);
+        }
+        world w;
+        for (const traced_call &c : traced_calls()) {
+            SCOPED_TRACE(std::string(c.call) + " at level " + std::to_string(level));
+            std::size_t before = read_trace(file).size();
+            expected x, bare;
+            bad_param("caller", 7, 0x1234u);
+            kx_int32_t rc = c.run(w, x);
+            if (rc == SEC_S_OK && (c.kind & clears)) {
+                EXPECT_EQ(last_error().id, 0);
+            } else if (rc == SEC_S_OK) {
+                EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
+            }
+            if (level == 1 && c.enter)
+                bare.at(c.enter), bare.at(c.exit);
+            else if (level == 4 && (c.kind & release))
+                bare.at(c.exit);
+            std::vector<std::string> got;
+            std::vector<trace_record> all = read_trace(file);
+            for (std::size_t i = before; i < all.size(); ++i)
+                got.push_back(described(all[i].id, all[i].items));
+            EXPECT_EQ(got, level == 8 ? x.records : bare.records);
+        }
+    }
+    for (unsigned id : trace_ids(file))
+        EXPECT_NE(id, 0u);
+}
+
+TEST(ApiTrace, PerfLevelIsAnnouncedAtRegistration) {
+    std::string file = start_tracing("_SEL:Perf=2");
+    kx_uint32_t mask;
+    sec_translate_perms("r", nullptr, &mask);
+    ASSERT_EQ(trace_ids(file), (std::vector<unsigned>{0}));
+    EXPECT_EQ(read_trace(file)[0].items, (std::vector<std::string>{i32(2)}));
+}
+
+// A registration that the trace library refuses leaves the caller's record.
+TEST(ApiTrace, FailedRegistrationKeepsTheCallersRecord) {
+    static tr_detail_level_t levels[1];
+    static const tr_category_description_t cats[1] = {{0, "Other", 0, 0}};
+    ASSERT_EQ(tr_register_component_1("_SEL", levels, cats, 1), TR_OK);
+    bad_param("caller", 7, 0x1234u);
+    kx_uint32_t mask;
+    EXPECT_EQ(sec_translate_perms("r", nullptr, &mask), SEC_S_OK);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
+}
+
+// ---- the file reader's own points ------------------------------------------
+
+// Info 1: examining and opening, the cache written, an empty file, and a
+// CACL file of another mode with both owners and modes; Info 8 adds every
+// line consumed with its number, type, mechanism, identity and mask.
+TEST(FileTrace, InfoPoints) {
+    std::string trace = start_tracing("_SEL:Info=1");
+    acl_dir d("o r\n# c\ng staff rw\n");
+    ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
+    ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
+    auto records = read_trace(trace);
+    // Examine, absent, open the text, cache absent; examine, open the CACL file.
+    ASSERT_EQ(ids_of(records), (std::vector<unsigned>{117, 118, 121, 110, 117, 121}));
+    EXPECT_EQ(records[0].items, (std::vector<std::string>{hex_text(d.cacl)}));
+    EXPECT_EQ(records[1].items[1], i32(ENOENT));
+    EXPECT_EQ(records[2].items, (std::vector<std::string>{hex_text(d.acl)}));
+    EXPECT_EQ(records[5].items, (std::vector<std::string>{hex_text(d.cacl)}));
+
+    acl_dir empty("");
+    write_file(empty.cacl, "x", 0600);
+    ASSERT_EQ(acl_read(empty.acl, CACHE).status, SEC_S_OK);
+    acl_dir foreign;
+    write_file(foreign.cacl, "x", 0600);
+    ASSERT_EQ(acl_read(foreign.acl, 0).status, SEC_S_OK);
+    records = read_trace(trace);
+    ASSERT_GE(records.size(), 9u);
+    EXPECT_EQ(records[6].id, 116u); // the empty file; its CACL file is not looked at
+    EXPECT_EQ(records[6].items, (std::vector<std::string>{hex_text(empty.acl)}));
+    ASSERT_EQ(records[8].id, 120u);
+    ASSERT_EQ(records[8].items.size(), 7u);
+    EXPECT_EQ(records[8].items[0], hex_text(foreign.acl));
+    EXPECT_EQ(records[8].items[5], u32(S_IFREG | 0644));
+    EXPECT_EQ(records[8].items[6], u32(S_IFREG | 0600));
+
+    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Info", 8), TR_OK);
+    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
+    std::vector<std::vector<std::string>> lines;
+    for (const trace_record &r : read_trace(trace))
+        if (r.id == 114)
+            lines.push_back(r.items);
+    auto line = [](int n, int type, const char *id, kx_uint32_t perm) {
+        return std::vector<std::string>{i32(n), i32(type), txt(""), txt(id), u32(perm)};
+    };
+    EXPECT_EQ(lines, (std::vector<std::vector<std::string>>{line(1, 2, "", 1), line(2, 0, "", 0),
+                                                            line(3, 16, "staff", 3)}));
+}
+
+// Perf 1 times the compile's steps; Perf 2 the opening and reading alone.
+TEST(FileTrace, PerfPointsOfACompile) {
+    std::string trace = start_tracing("_SEL:Perf=1");
+    acl_dir d;
+    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
+    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Perf", 2), TR_OK);
+    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
+    auto records = read_trace(trace);
+    ASSERT_EQ(ids_of(records), (std::vector<unsigned>{0, 1, 2, 3, 4, 6}));
+    EXPECT_EQ(records[1].items.size(), 4u);
+    EXPECT_EQ(records[2].items.size(), 4u);
+    ASSERT_EQ(records[3].items.size(), 5u);
+    EXPECT_EQ(records[3].items[1], i32(4));
+}
+
+} // namespace

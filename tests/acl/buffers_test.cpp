@@ -1,0 +1,434 @@
+// ACL buffers through the exported functions: the empty ACL, copies of a
+// caller's bytes, conversion, release, listing and editing, and every
+// allocation failure of each. Argument refusals are in api_table_test.
+#include <cctype>
+
+#include <gtest/gtest.h>
+
+#include "acl_fixtures.h"
+
+using namespace kxacl;
+using namespace kxtest;
+
+namespace {
+
+// Whether the record holds msg with status and arguments that start with args.
+testing::AssertionResult record_starts(kx_int32_t status, int msg, const std::vector<arg> &args) {
+    error_record e = last_error();
+    if (e.id == status && e.msg_num == msg && e.args.size() >= args.size() &&
+        std::equal(args.begin(), args.end(), e.args.begin()))
+        return testing::AssertionSuccess();
+    return testing::AssertionFailure()
+           << "record " << e.id << ", message " << e.msg_num << ": " << e.text;
+}
+
+// ---- the empty ACL, copies, conversion and release ---------------------------
+
+TEST(AclLifecycle, CreateAndRelease) {
+    owned_acl acl;
+    ASSERT_EQ(sec_create_empty_acl(acl.get()), SEC_S_OK);
+    EXPECT_EQ(acl.contents(), empty_acl_bytes);
+    sec_buffer_s released{0, nullptr};
+    EXPECT_EQ(sec_release_acl(nullptr), SEC_S_OK);
+    EXPECT_EQ(sec_release_acl(&released), SEC_S_OK);
+    ASSERT_EQ(sec_create_empty_acl(&released), SEC_S_OK);
+    EXPECT_EQ(sec_release_acl(&released), SEC_S_OK);
+    EXPECT_TRUE(released.value == nullptr && released.length == 0);
+    EXPECT_EQ(sec_release_acl(&released), SEC_S_OK);
+    EXPECT_EQ(last_error().id, 0);
+}
+
+// A copy made by sec_read_acl_from_data, converted: the outcome, and the
+// bytes after a success. Three bytes are taken unchecked; only the header's
+// start passes 2650-109. A buffer of the other order is converted whatever
+// its mark; only one in host order is validated.
+TEST(ConvertAclToHost, Outcomes) {
+    bytes mark_0 = worked_example_swapped, mark_ff = worked_example_swapped;
+    mark_0[2] = 0;
+    mark_ff[2] = 0xff;
+    bytes bad_version = worked_example_swapped, converted = worked_example;
+    bad_version[60] = 7; // the ACLE version of bob's record
+    converted[60] = 7;
+    const bytes rich = rich_acl();
+    struct {
+        bytes in;
+        sec_boolean_t verify;
+        kx_int32_t status;
+        int msg;
+        std::vector<arg> args; // the first arguments
+        bytes out;
+    } cases[] = {
+        {empty_acl_bytes, 1, SEC_S_OK, 0, {}, empty_acl_bytes},
+        {{'a', 'b', 'c'}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
+        {{0x85, 2, 2}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
+        {{1, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
+        {{0x85, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_119, {3}, {}},
+        {worked_example_swapped, 0, SEC_S_OK, 0, {}, worked_example},
+        {mark_0, 0, SEC_S_OK, 0, {}, worked_example},
+        {mark_ff, 0, SEC_S_OK, 0, {}, worked_example},
+        {swapped_order(rich), 1, SEC_S_OK, 0, {}, rich},
+        {bad_version, 1, SEC_S_OK, 0, {}, converted},
+        {converted, 1, SEC_S_BAD_ACLE, MSG_2650_125, {7}, {}},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(hex_of(c.in.data(), c.in.size()));
+        owned_acl acl;
+        bytes in = c.in;
+        ASSERT_EQ(sec_read_acl_from_data(static_cast<kx_int32_t>(in.size()), in.data(), acl.get()),
+                  SEC_S_OK);
+        EXPECT_EQ(acl.contents(), c.in);
+        EXPECT_EQ(sec_convert_acl_to_host(c.verify, acl.get()), c.status);
+        if (c.status == SEC_S_OK) {
+            EXPECT_EQ(acl.contents(), c.out);
+            EXPECT_EQ(last_error().id, 0);
+        } else {
+            EXPECT_TRUE(record_starts(c.status, c.msg, c.args));
+        }
+    }
+}
+
+// Each makes one allocation; on failure the descriptor keeps its length.
+TEST(AllocationFailure, ReadAclFromDataAndCreateEmptyAcl) {
+    bytes b = worked_example;
+    for (bool create : {false, true}) {
+        EXPECT_EQ(for_each_allocation_failure([&](long n) {
+                      owned_acl acl;
+                      acl.d.length = -3;
+                      kx_int32_t rc = failing_after(n, [&] {
+                          return create ? sec_create_empty_acl(acl.get())
+                                        : sec_read_acl_from_data(71, b.data(), acl.get());
+                      });
+                      if (rc != SEC_S_OK) {
+                          expect_no_memory(
+                              rc, {create ? "sec_create_empty_acl" : "sec_read_acl_from_data"});
+                          EXPECT_EQ(last_error().num(1), create ? 5 : 71);
+                          EXPECT_EQ(acl.d.length, -3);
+                          EXPECT_EQ(acl.d.value, nullptr);
+                      }
+                      return rc;
+                  }),
+                  1);
+    }
+}
+
+// ---- listing ---------------------------------------------------------------
+
+// type 0 lists everything; a failure leaves the list empty.
+texts listed(const bytes &b, unsigned char type, const char *mech, kx_int32_t status) {
+    owned_acl acl(b);
+    owned_list list;
+    EXPECT_EQ(type ? sec_list_acl_by_type(acl.get(), type, const_cast<char *>(mech), list.get())
+                   : sec_list_acl(acl.get(), list.get()),
+              status);
+    EXPECT_TRUE(status == SEC_S_OK || list.l.count == 0);
+    return list.described();
+}
+
+// Found by fuzzing: a sub-ACL of length 0 made a walk of all sub-ACLs read
+// the same sub-ACL and its record for every count of the header, 60000
+// times for 46 bytes. The records of a sub-ACL that another one follows
+// must end where that one starts, and a sub-ACL too short for its own
+// header leads on to no other. The last sub-ACL's records may run past its
+// length, as validation allows.
+bytes zero_length_subacl() {
+    bytes b =
+        make_acl({make_subacl(4, 1, text_field("unix"), {make_record(1, text_field("bob"))})});
+    store_u32(&b[5], 0);
+    b[3] = 3;
+    return b;
+}
+
+TEST(ListAcl, OrderSpellingAndRefusals) {
+    const bytes rich = rich_acl();
+    const texts unix_users = {"4 unix Alice@node1.cluster.example.com 5",
+                              "4 unix bob@node1.cluster.example.com 3",
+                              "4 unix carol@node1.cluster.example.com 16"};
+    const std::string krb5_user = "4 krb5 admin/node1.cluster.example.com@REALM 1";
+    texts all = {
+        "2  - 8191",          "1  - 1",     krb5_user, "8 unix z*@node2 7", "8 unix a*@node3 2",
+        "16  b\xc3\xb6rse 4", "16  staff 1"};
+    all.insert(all.end(), unix_users.begin(), unix_users.end());
+    texts users = unix_users;
+    users.insert(users.begin(), krb5_user);
+    bytes too_short = make_acl({make_subacl(2, 0, {}, {})});
+    store_u32(&too_short[5], 0);
+    store_u16(&too_short[3], 0xffff);
+    const bytes bob = make_record(4, text_field("Bob"));
+    const kx_int32_t bad = SEC_S_BAD_ACL;
+    // clang-format off
+    const struct {
+        const char *what;
+        bytes acl;
+        unsigned char type;
+        const char *mech;
+        kx_int32_t status;
+        int msg;
+        texts entries;
+    } cases[] = {
+        {"every entry", rich, 0, nullptr, SEC_S_OK, 0, all},
+        {"users of a mech", rich, SEC_ACLE_USER, "UNIX", SEC_S_OK, 0, unix_users},
+        {"users of every mech", rich, SEC_ACLE_USER, nullptr, SEC_S_OK, 0, users},
+        {"unauthenticated, any mech", rich, 1, "a-mechanism-of-20-ch", SEC_S_OK, 0, {"1  - 1"}},
+        {"no expanded krb5", rich, SEC_ACLE_EXPANDED, "krb5", SEC_S_OK, 0, {}},
+        {"no unauthenticated", worked_example, 1, nullptr, SEC_S_OK, 0, {}},
+        {"the empty ACL", {}, 0, nullptr, SEC_S_OK, 0, {}},
+        {"the empty ACL's groups", {}, SEC_ACLE_GROUP, nullptr, SEC_S_OK, 0, {}},
+        {"no sub-ACLs", empty_acl_bytes, 0, nullptr, SEC_S_OK, 0, {}},
+        {"no sub-ACLs' groups", empty_acl_bytes, SEC_ACLE_GROUP, nullptr, SEC_S_OK, 0, {}},
+        // Neither the mechanism's case nor non-UTF-8 bytes are touched.
+        {"as stored", make_acl({make_subacl(4, 2, text_field("UniX"),
+                                            {make_record(1, text_field("\xe9t\xe9")),
+                                             make_record(2, text_field("Zo\xc3\xab"))})}),
+         0, nullptr, SEC_S_OK, 0, {"4 UniX Zo\xc3\xab 2", "4 UniX \xe9t\xe9 1"}},
+        // Records of one identity, apart or not: the first spelling, the last mask.
+        {"one identity twice", make_acl({make_subacl(16, 4, {},
+                                                     {bob, make_record(2, text_field("BOB")),
+                                                      make_record(4, text_field("carl")),
+                                                      make_record(8, text_field("bob"))})}),
+         0, nullptr, SEC_S_OK, 0, {"16  Bob 8", "16  carl 4"}},
+        {"the last sub-ACL's records past its length",
+         make_acl({make_subacl(2, 1, {}, {make_record(1)}),
+                   make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, -7)}),
+         0, nullptr, SEC_S_OK, 0, {"2  - 1", "16  staff 1"}},
+        {"sub-ACL of length 0", zero_length_subacl(), 0, nullptr, bad, MSG_2650_110, {}},
+        {"sub-ACL of length 0, by type", zero_length_subacl(), 4, nullptr, bad, MSG_2650_110, {}},
+        {"sub-ACL shorter than its header", too_short, 0, nullptr, bad, MSG_2650_110, {}},
+        {"anyother of two records",
+         make_acl({make_subacl(2, 2, {}, {make_record(1), make_record(2)})}),
+         0, nullptr, bad, MSG_2650_111, {}},
+        {"mnemonic longer than an entry's",
+         make_acl({make_subacl(4, 1, text_field("0123456789abcdefg"), {bob})}),
+         0, nullptr, bad, MSG_2650_123, {}},
+    };
+    // clang-format on
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.what);
+        EXPECT_EQ(listed(c.acl, c.type, c.mech, c.status), c.entries);
+        if (c.status != SEC_S_OK) {
+            EXPECT_TRUE(record_starts(c.status, c.msg, {}));
+        }
+    }
+    // A mnemonic of sixteen bytes fills the field.
+    EXPECT_EQ(listed(make_acl({make_subacl(4, 1, text_field("0123456789abcdef"), {bob})}), 0,
+                     nullptr, SEC_S_OK),
+              texts{"4 0123456789abcdef Bob 4"});
+}
+
+TEST(ListAcl, ReleaseEmptiesTheListOnce) {
+    owned_acl acl(worked_example);
+    sec_acle_list_s list{0, nullptr};
+    ASSERT_EQ(sec_list_acl(acl.get(), &list), SEC_S_OK);
+    ASSERT_EQ(list.count, 3);
+    sec_release_aclelist(&list);
+    EXPECT_EQ(list.count, 0);
+    EXPECT_EQ(list.acles, nullptr);
+    sec_release_aclelist(&list);
+    sec_release_aclelist(nullptr);
+}
+
+// Every allocation of a listing fails in turn: the list ends empty. Two
+// group entries in order take the list and one block per entry; the other
+// listings build trees as well.
+TEST(AllocationFailure, ListAclAndListAclByType) {
+    bytes rich = rich_acl();
+    for (auto [type, allocations] :
+         {std::pair<unsigned char, long>{0, 10}, {SEC_ACLE_USER, 6}, {SEC_ACLE_GROUP, 3}}) {
+        EXPECT_GE(for_each_allocation_failure([&](long n) {
+                      owned_acl acl(rich);
+                      owned_list list;
+                      kx_int32_t rc = failing_after(n, [&] {
+                          return type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
+                                      : sec_list_acl(acl.get(), list.get());
+                      });
+                      if (rc != SEC_S_OK) {
+                          expect_no_memory(rc, {"sec__create_acle", "sec__add_acle_to_tree",
+                                                "sec__acltree_to_aclelist"});
+                          EXPECT_EQ(list.l.count, 0);
+                          EXPECT_EQ(list.l.acles, nullptr);
+                      }
+                      return rc;
+                  }),
+                  allocations);
+    }
+}
+
+// ---- editing ---------------------------------------------------------------
+
+bytes worked_part(long from, long to) {
+    return bytes(worked_example.begin() + from, worked_example.begin() + to);
+}
+const bytes anyother_r = worked_part(5, 22), group_staff = worked_part(22, 45),
+            user_bob = worked_part(45, 71);
+
+kx_int32_t add(owned_acl &acl, entry e) {
+    return sec_add_acle_to_acl(e.p(), acl.get());
+}
+kx_int32_t add_only(owned_acl &acl, entry e) {
+    return sec_add_acle_to_acl2(e.p(), acl.get());
+}
+kx_int32_t del(owned_acl &acl, entry e) {
+    return sec_del_acle_from_acl(e.p(), acl.get());
+}
+
+TEST(AddAcle, NewEntriesAndSubacls) {
+    owned_acl acl;
+    ASSERT_EQ(add(acl, {SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_OK);
+    EXPECT_EQ(acl.contents(), make_acl({user_bob}));
+
+    owned_acl more(worked_example);
+    ASSERT_EQ(add(more, {SEC_ACLE_GROUP, 0x2, "unix", "wheel"}), SEC_S_OK);
+    ASSERT_EQ(add(more, {SEC_ACLE_USER, 0x4, "UNIX", ""}), SEC_S_OK);
+    ASSERT_EQ(add(more, {SEC_ACLE_USER, 0x1, "KRB5", "bob"}), SEC_S_OK);
+    ASSERT_EQ(add(more, {SEC_ACLE_UNAUTHENTICATED, 0x2, "unix", "someone"}), SEC_S_OK);
+    EXPECT_EQ(
+        more.contents(),
+        make_acl({anyother_r,
+                  make_subacl(
+                      16, 2, {},
+                      {make_record(1, text_field("staff")), make_record(2, text_field("wheel"))}),
+                  make_subacl(4, 2, text_field("unix"),
+                              {make_record(4, text_field("")), make_record(3, text_field("bob"))}),
+                  make_subacl(4, 1, text_field("KRB5"), {make_record(1, text_field("bob"))}),
+                  make_subacl(1, 1, {}, {make_record(2)})}));
+}
+
+// Found by fuzzing: validation lets bytes follow the last sub-ACL, and a
+// new sub-ACL appended behind them could not be reached by its length walk.
+// It goes right after the last sub-ACL; when that one's records do not end
+// where its length says (which validation lets pass for the last one only),
+// no sub-ACL can follow it and the add is refused.
+TEST(AddAcle, NewSubaclGoesBeforeTrailingBytes) {
+    const bytes trailing = {0xde, 0xad};
+    bytes base = make_acl({anyother_r});
+    base.insert(base.end(), trailing.begin(), trailing.end());
+    owned_acl acl(base);
+    ASSERT_EQ(add(acl, {SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_OK);
+    bytes expected = make_acl({anyother_r, user_bob});
+    expected.insert(expected.end(), trailing.begin(), trailing.end());
+    EXPECT_EQ(acl.contents(), expected);
+    EXPECT_EQ(sec_convert_acl_to_host(1, acl.get()), SEC_S_OK);
+
+    for (int wrong_by : {-3, 2}) {
+        bytes last = make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, wrong_by);
+        bytes odd = make_acl({last});
+        odd.insert(odd.end(), trailing.begin(), trailing.end());
+        owned_acl refused(odd);
+        ASSERT_EQ(sec_convert_acl_to_host(1, refused.get()), SEC_S_OK);
+        EXPECT_EQ(add(refused, {SEC_ACLE_USER, 0x3, "unix", "bob"}), SEC_S_BAD_ACL);
+        expect_error(SEC_S_BAD_ACL, MSG_2650_110);
+        EXPECT_EQ(refused.contents(), odd);
+    }
+}
+
+TEST(AddAcle, SameIdentityUpdatesOrIsRefused) {
+    owned_acl acl(worked_example);
+    bytes updated = worked_example;
+    updated[61] = 0x7;
+    updated[16] = 0x5;
+    ASSERT_EQ(add(acl, {SEC_ACLE_USER, 0x7, "UNIX", "BOB"}), SEC_S_OK);
+    ASSERT_EQ(add(acl, {SEC_ACLE_ANYOTHER, 0x5}), SEC_S_OK);
+    EXPECT_EQ(acl.contents(), updated);
+
+    EXPECT_EQ(add_only(acl, {SEC_ACLE_USER, 0x1, "Unix", "Bob"}), SEC_S_BAD_ACLE);
+    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_157, {'u', "Unix", "Bob"}));
+    EXPECT_EQ(add_only(acl, {SEC_ACLE_ANYOTHER, 0x1}), SEC_S_BAD_ACLE);
+    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_174, {'o'}));
+    EXPECT_EQ(add_only(acl, {SEC_ACLE_GROUP, 0x1, "", "STAFF"}), SEC_S_BAD_ACLE);
+    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_175, {'g', "STAFF"}));
+    EXPECT_EQ(acl.contents(), updated);
+}
+
+TEST(DelAcle, ByIdentityAndRefusals) {
+    owned_acl acl(worked_example);
+    ASSERT_EQ(del(acl, {SEC_ACLE_USER, 0xff, "UNIX", "BOB"}), SEC_S_OK);
+    EXPECT_EQ(acl.contents(), make_acl({anyother_r, group_staff}));
+    EXPECT_EQ(del(acl, {SEC_ACLE_USER, 0xff, "UNIX", "BOB"}), SEC_S_ACLE_NOT_FOUND);
+    EXPECT_TRUE(record_is(SEC_S_ACLE_NOT_FOUND, MSG_2650_118, {4, "UNIX", "BOB"}));
+    EXPECT_EQ(del(acl, {SEC_ACLE_GROUP, 0, "", "wheel"}), SEC_S_ACLE_NOT_FOUND);
+    ASSERT_EQ(del(acl, {SEC_ACLE_GROUP, 0, "", "Staff"}), SEC_S_OK);
+    ASSERT_EQ(del(acl, {SEC_ACLE_ANYOTHER, 0}), SEC_S_OK);
+    EXPECT_EQ(acl.contents(), empty_acl_bytes);
+
+    owned_acl no_entries(make_acl({make_subacl(16, 0, {}, {})}));
+    EXPECT_EQ(del(no_entries, {SEC_ACLE_GROUP, 0, "", "staff"}), SEC_S_BAD_ACLE);
+    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_118, {16, "", "staff"}));
+}
+
+// Adding an identity that the ACL lacks and deleting it again gives back
+// the same bytes, whether its sub-ACL existed or the add made it.
+TEST(EditRoundTrip, AddThenDeleteRestoresTheBuffer) {
+    bytes rich = rich_acl();
+    struct {
+        const bytes &base;
+        entry added;
+    } cases[] = {
+        {worked_example, {SEC_ACLE_USER, 1, "unix", "Aaron"}},
+        {worked_example, {SEC_ACLE_USER, 1, "krb5", "bob"}},
+        {worked_example, {SEC_ACLE_EXPANDED, 1, "unix", "x*"}},
+        {worked_example, {SEC_ACLE_GROUP, 1, "", "wheel"}},
+        {rich, {SEC_ACLE_EXPANDED, 1, "UNIX", "q*"}},
+        {rich, {SEC_ACLE_USER, 1, "unix", "brian@node1.cluster.example.com"}},
+        {rich, {SEC_ACLE_GROUP, 1, "", "adm"}},
+        {empty_acl_bytes, {SEC_ACLE_GROUP, 1, "", "wheel"}},
+    };
+    for (auto &c : cases) {
+        SCOPED_TRACE(c.added.id);
+        owned_acl acl(c.base);
+        ASSERT_EQ(add_only(acl, c.added), SEC_S_OK);
+        EXPECT_GT(acl.contents().size(), c.base.size());
+        entry removed = c.added;
+        for (char &ch : removed.id)
+            ch = static_cast<char>(std::toupper(static_cast<unsigned char>(ch)));
+        removed.desc.perm = 0xdead;
+        ASSERT_EQ(del(acl, removed), SEC_S_OK);
+        EXPECT_EQ(acl.contents(), c.base);
+    }
+}
+
+enum class edit { add, add_only, del };
+
+kx_int32_t run(edit how, owned_acl &acl, entry e) {
+    return how == edit::add ? add(acl, e) : how == edit::add_only ? add_only(acl, e) : del(acl, e);
+}
+
+// Every allocation of an edit fails in turn. A failed add leaves the
+// buffer as it was; so does a failed delete, unless only its final shrink
+// failed, which leaves the valid ACL without the entry.
+void expect_failed_edits_harmless(edit how, const bytes &base, entry e) {
+    owned_acl done(base);
+    ASSERT_EQ(run(how, done, e), SEC_S_OK);
+    bool shrink_failed = false;
+    long failures = for_each_allocation_failure([&](long n) {
+        owned_acl acl(base);
+        kx_int32_t rc = failing_after(n, [&] { return run(how, acl, e); });
+        if (rc == SEC_S_OK)
+            return rc;
+        expect_no_memory(rc, {how == edit::del ? "sec_del_acle_from_acl" : "sec_add_acle_to_acl",
+                              "sec__create_acle", "sec__add_acle_to_tree", "sec__acltree_to_subacl",
+                              "sec__add_acle_to_subacl"});
+        if (how == edit::del && acl.contents() != base) {
+            shrink_failed = true;
+            EXPECT_EQ(last_error().str(0), "sec_del_acle_from_acl");
+            EXPECT_EQ(acl.contents(), done.contents());
+        } else {
+            EXPECT_EQ(acl.contents(), base);
+            EXPECT_EQ(acl.d.value == nullptr, base.empty());
+        }
+        return rc;
+    });
+    EXPECT_GE(failures, 2);
+    EXPECT_EQ(shrink_failed, how == edit::del);
+}
+
+TEST(AllocationFailure, EditsOfAnAcl) {
+    for (edit how : {edit::add, edit::add_only}) {
+        expect_failed_edits_harmless(how, {}, {SEC_ACLE_USER, 1, "unix", "bob"});
+        expect_failed_edits_harmless(how, worked_example, {SEC_ACLE_USER, 1, "unix", "carol"});
+        expect_failed_edits_harmless(how, worked_example, {SEC_ACLE_EXPANDED, 1, "unix", "x*"});
+    }
+    // The sub-ACL goes with its only entry, or stays shorter.
+    expect_failed_edits_harmless(edit::del, worked_example, {SEC_ACLE_USER, 0, "unix", "bob"});
+    expect_failed_edits_harmless(edit::del, rich_acl(), {SEC_ACLE_EXPANDED, 0, "unix", "z*@node2"});
+}
+
+} // namespace
