@@ -57,32 +57,24 @@ inline std::string describe(const cu_error_t *err) {
         << ' ' << err->cu_msg_set << '.' << err->cu_msg_num << ' ' << quoted(err->cu_msg_default);
     if (err->cu_args == nullptr)
         return out.str() + (err->cu_arg_cnt == 0 ? " NULL" : " NULL with a count");
-    out << " [";
     for (kx_uint32_t i = 0; i < err->cu_arg_cnt; ++i) {
-        const cu_error_arg_t &a = err->cu_args[i];
-        const auto &v = a.cu_arg_value;
-        out << (i ? " " : "");
-        switch (a.cu_arg_type) {
-        case CU_ERROR_ARG_INT:
+        const auto &v = err->cu_args[i].cu_arg_value;
+        const int kind = err->cu_args[i].cu_arg_type;
+        out << (i == 0 ? " [" : " ");
+        if (kind == CU_ERROR_ARG_INT)
             out << 'i' << v.cu_arg_int;
-            break;
-        case CU_ERROR_ARG_LONG:
+        else if (kind == CU_ERROR_ARG_LONG)
             out << 'l' << v.cu_arg_long;
-            break;
-        case CU_ERROR_ARG_LONG_LONG:
+        else if (kind == CU_ERROR_ARG_LONG_LONG)
             out << "ll" << v.cu_arg_long_long;
-            break;
-        case CU_ERROR_ARG_DOUBLE:
+        else if (kind == CU_ERROR_ARG_DOUBLE)
             out << 'd' << v.cu_arg_double;
-            break;
-        case CU_ERROR_ARG_CHAR_STR:
+        else if (kind == CU_ERROR_ARG_CHAR_STR)
             out << 's' << quoted(v.cu_arg_char_str);
-            break;
-        default:
+        else
             out << 'p' << v.cu_arg_void_ptr;
-        }
     }
-    return out.str() + "]";
+    return out.str() + (err->cu_arg_cnt == 0 ? " []" : "]");
 }
 
 inline std::string current_record() {
