@@ -76,9 +76,8 @@ zero_run longest_zero_run(const unsigned (&groups)[8]) noexcept {
 }
 
 bool is_v4_mapped(const unsigned char *b) noexcept {
-    static constexpr unsigned char v4_mapped_prefix[12] = {0, 0, 0, 0, 0,    0,
-                                                           0, 0, 0, 0, 0xff, 0xff};
-    return std::memcmp(b, v4_mapped_prefix, sizeof v4_mapped_prefix) == 0;
+    static constexpr unsigned char v4_mapped[12] = {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0xff, 0xff};
+    return std::memcmp(b, v4_mapped, sizeof v4_mapped) == 0;
 }
 
 void write_ipv6(text_writer &out, const unsigned char *b) noexcept {
