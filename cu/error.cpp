@@ -22,60 +22,60 @@
 namespace kx::cu {
 namespace {
 
-char s_no_memory_text[] = "There is not enough memory to record the error.\n";
+char no_memory_text[] = "There is not enough memory to record the error.\n";
 
 // Stands in for a record that could not be allocated; never freed.
-cu_error_t s_no_memory_record = {
-    CU_ERROR_ID_NO_MEMORY, nullptr, nullptr, 0, 0, s_no_memory_text, 0, nullptr,
+cu_error_t no_memory_record = {
+    CU_ERROR_ID_NO_MEMORY, nullptr, nullptr, 0, 0, no_memory_text, 0, nullptr,
 };
 
-char s_null_text[] = "(null)";
+char null_text[] = "(null)";
 
 // The calling thread's record; NULL when no error is set. initial-exec keeps
 // the check on the request path to a single load from the thread pointer.
-[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *t_record = nullptr;
-[[gnu::tls_model("initial-exec")]] thread_local std::size_t t_record_size = 0;
-[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *t_spare = nullptr;
-[[gnu::tls_model("initial-exec")]] thread_local std::size_t t_spare_size = 0;
-[[gnu::tls_model("initial-exec")]] thread_local bool t_reaper_armed = false;
+[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *thread_record = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local std::size_t thread_record_size = 0;
+[[gnu::tls_model("initial-exec")]] thread_local cu_error_t *thread_spare = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local std::size_t thread_spare_size = 0;
+[[gnu::tls_model("initial-exec")]] thread_local bool reaper_armed = false;
 
 void release_record(cu_error_t *rec) noexcept {
-    if (rec != &s_no_memory_record)
+    if (rec != &no_memory_record)
         std::free(rec);
 }
 
 // Keeps the block of a record that the thread no longer holds as its spare,
 // the larger of it and the current spare; frees the other.
 void retire_record(cu_error_t *rec, std::size_t size) noexcept {
-    if (rec == nullptr || rec == &s_no_memory_record)
+    if (rec == nullptr || rec == &no_memory_record)
         return;
-    if (size <= t_spare_size) {
+    if (size <= thread_spare_size) {
         std::free(rec);
         return;
     }
-    std::free(std::exchange(t_spare, rec));
-    t_spare_size = size;
+    std::free(std::exchange(thread_spare, rec));
+    thread_spare_size = size;
 }
 
 // Frees the records of an ending thread. A pthread key does this rather than
 // a thread_local destructor: registering one of those allocates, and glibc
 // aborts the process when that allocation fails.
 void reap_thread_record(void *) noexcept {
-    t_reaper_armed = false;
-    release_record(std::exchange(t_record, nullptr));
-    std::free(std::exchange(t_spare, nullptr));
-    t_spare_size = 0;
+    reaper_armed = false;
+    release_record(std::exchange(thread_record, nullptr));
+    std::free(std::exchange(thread_spare, nullptr));
+    thread_spare_size = 0;
 }
 
 bool arm_reaper() noexcept {
-    if (t_reaper_armed)
+    if (reaper_armed)
         return true;
     static pthread_key_t key;
     static const bool have_key = pthread_key_create(&key, reap_thread_record) == 0;
     // Any non-NULL value makes the key's destructor run at thread exit.
-    if (!have_key || pthread_setspecific(key, &t_reaper_armed) != 0)
+    if (!have_key || pthread_setspecific(key, &reaper_armed) != 0)
         return false;
-    t_reaper_armed = true;
+    reaper_armed = true;
     return true;
 }
 
@@ -86,12 +86,12 @@ int store_thread_record(cu_error_t *rec, std::size_t size) noexcept {
     int status = 0;
     if (rec == nullptr || !arm_reaper()) {
         release_record(rec);
-        rec = &s_no_memory_record; // static: needs no reaping
+        rec = &no_memory_record; // static: needs no reaping
         size = 0;
         status = CU_ERROR_ID_NO_MEMORY;
     }
-    cu_error_t *old = std::exchange(t_record, rec);
-    retire_record(old, std::exchange(t_record_size, size));
+    cu_error_t *old = std::exchange(thread_record, rec);
+    retire_record(old, std::exchange(thread_record_size, size));
     return status;
 }
 
@@ -105,15 +105,15 @@ bool add_text_size(std::size_t &total, const char *text) noexcept {
 
 const char *arg_text(const cu_error_arg_t &arg) noexcept {
     const char *text = arg.cu_arg_value.cu_arg_char_str;
-    return text != nullptr ? text : s_null_text;
+    return text != nullptr ? text : null_text;
 }
 
-constexpr std::size_t kArgsOffset = (sizeof(cu_error_t) + alignof(cu_error_arg_t) - 1) /
+constexpr std::size_t args_offset = (sizeof(cu_error_t) + alignof(cu_error_arg_t) - 1) /
                                     alignof(cu_error_arg_t) * alignof(cu_error_arg_t);
 
 // Bytes a one-block copy of src needs; 0 when that overflows.
 std::size_t record_size(const cu_error_t &src, std::uint32_t arg_cnt) noexcept {
-    std::size_t total = kArgsOffset;
+    std::size_t total = args_offset;
     std::size_t args_size = 0;
     if (__builtin_mul_overflow(std::size_t{arg_cnt}, sizeof(cu_error_arg_t), &args_size) ||
         !add_size(total, args_size) || !add_text_size(total, src.cu_ffdc_id) ||
@@ -128,9 +128,9 @@ std::size_t record_size(const cu_error_t &src, std::uint32_t arg_cnt) noexcept {
 }
 
 // Hands out consecutive text slots of a block sized by record_size.
-class TextArea {
+class text_area {
   public:
-    explicit TextArea(char *start) noexcept : next_(start) {}
+    explicit text_area(char *start) noexcept : next_(start) {}
 
     char *copy(const char *text) noexcept {
         if (text == nullptr)
@@ -152,8 +152,8 @@ std::uint32_t arg_count(const cu_error_t &src) noexcept {
 // Builds a deep copy of src in block, which has record_size() bytes.
 cu_error_t *fill_record(const cu_error_t &src, std::uint32_t arg_cnt, char *block) noexcept {
     auto *rec = new (block) cu_error_t(src);
-    auto *args = reinterpret_cast<cu_error_arg_t *>(block + kArgsOffset);
-    TextArea texts(block + kArgsOffset + arg_cnt * sizeof(cu_error_arg_t));
+    auto *args = reinterpret_cast<cu_error_arg_t *>(block + args_offset);
+    text_area texts(block + args_offset + arg_cnt * sizeof(cu_error_arg_t));
     rec->cu_ffdc_id = texts.copy(src.cu_ffdc_id);
     rec->cu_msg_cat = texts.copy(src.cu_msg_cat);
     rec->cu_msg_default = texts.copy(src.cu_msg_default);
@@ -184,9 +184,9 @@ int set_thread_record(const cu_error_t &src) noexcept {
         return store_thread_record(nullptr, 0);
     char *block = nullptr;
     std::size_t size = needed;
-    if (t_spare != nullptr && t_spare_size >= needed) {
-        block = reinterpret_cast<char *>(std::exchange(t_spare, nullptr));
-        size = std::exchange(t_spare_size, 0);
+    if (thread_spare != nullptr && thread_spare_size >= needed) {
+        block = reinterpret_cast<char *>(std::exchange(thread_spare, nullptr));
+        size = std::exchange(thread_spare_size, 0);
     } else {
         block = static_cast<char *>(std::malloc(needed));
     }
@@ -194,28 +194,28 @@ int set_thread_record(const cu_error_t &src) noexcept {
 }
 
 // The kinds of the arguments a message text takes, numbered 1..count.
-struct ArgKinds {
+struct arg_kinds {
     unsigned count = 0;
-    kx_int32_t kind[kMaxArgs] = {};  // CU_ERROR_ARG_INT (0) for skipped numbers
-    bool long_double[kMaxArgs] = {}; // a %Lf-style double, passed as long double
-    bool seen[kMaxArgs] = {};
+    kx_int32_t kind[max_args] = {};  // CU_ERROR_ARG_INT (0) for skipped numbers
+    bool long_double[max_args] = {}; // a %Lf-style double, passed as long double
+    bool seen[max_args] = {};
 };
 
 // A number used with two kinds is read as the first; formatting later copies
 // the mismatched placeholder as it stands.
-ArgKinds collect_arg_kinds(const char *text) noexcept {
-    ArgKinds kinds;
+arg_kinds collect_arg_kinds(const char *text) noexcept {
+    arg_kinds kinds;
     if (text == nullptr)
         return kinds;
-    PlaceholderScanner scanner(text);
-    for (Piece piece; scanner.next(piece);) {
+    placeholder_scanner scanner(text);
+    for (text_piece piece; scanner.next(piece);) {
         if (!piece.is_placeholder)
             continue;
         const unsigned index = piece.ph.number - 1;
         if (!kinds.seen[index]) {
             kinds.seen[index] = true;
             kinds.kind[index] = piece.ph.kind;
-            kinds.long_double[index] = piece.ph.length == Length::L;
+            kinds.long_double[index] = piece.ph.length == length_modifier::L;
         }
         if (piece.ph.number > kinds.count)
             kinds.count = piece.ph.number;
@@ -274,9 +274,9 @@ CU_EXTERN int cu_set_error_1(kx_int32_t error_id, const char *ffdc_id, const cha
         cu_set_no_error_1();
         return 0;
     }
-    const ArgKinds kinds = collect_arg_kinds(msg_default);
+    const arg_kinds kinds = collect_arg_kinds(msg_default);
 
-    cu_error_arg_t args[kMaxArgs];
+    cu_error_arg_t args[max_args];
     va_list ap;
     va_start(ap, msg_default);
     for (unsigned i = 0; i < kinds.count; ++i)
@@ -306,20 +306,20 @@ CU_EXTERN int cu_pset_error_1(const cu_error_t *err) {
 }
 
 CU_EXTERN void cu_set_no_error_1(void) {
-    cu_error_t *rec = t_record;
+    cu_error_t *rec = thread_record;
     if (rec == nullptr) [[likely]]
         return;
-    t_record = nullptr;
-    retire_record(rec, std::exchange(t_record_size, 0));
+    thread_record = nullptr;
+    retire_record(rec, std::exchange(thread_record_size, 0));
 }
 
 CU_EXTERN void cu_get_error_1(cu_error_t **err) {
     if (err == nullptr)
         return;
-    const cu_error_t *rec = t_record;
+    const cu_error_t *rec = thread_record;
     cu_error_t *copy = rec != nullptr ? clone_record(*rec)
                                       : static_cast<cu_error_t *>(std::calloc(1, sizeof *copy));
-    *err = copy != nullptr ? copy : &s_no_memory_record;
+    *err = copy != nullptr ? copy : &no_memory_record;
 }
 
 CU_EXTERN void cu_rel_error_1(cu_error_t *err) {

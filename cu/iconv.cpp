@@ -24,11 +24,11 @@ struct cu_iconv_s {
 namespace kx::cu {
 namespace {
 
-constexpr kx_uint32_t kOpenFlags =
+constexpr kx_uint32_t open_flags =
     CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_STANDARD | CU_ICONV_UTF8_BMP_ONLY;
 
 // iconv_open's failure value, which the interface defines as (iconv_t)-1.
-const iconv_t kBadIconv = reinterpret_cast<iconv_t>(-1); // NOLINT(performance-no-int-to-ptr)
+const iconv_t bad_iconv = reinterpret_cast<iconv_t>(-1); // NOLINT(performance-no-int-to-ptr)
 
 bool from_utf8(const cu_iconv_s &h) noexcept {
     return (h.flags & CU_ICONV_FROM_UTF8) != 0;
@@ -36,7 +36,7 @@ bool from_utf8(const cu_iconv_s &h) noexcept {
 
 // ---- UTF-8 checks ----------------------------------------------------------
 
-struct Utf8Check {
+struct utf8_check {
     int status = CU_ICONV_OK;
     bool has_encoded_nul = false; // holds C0 80, the modified form of NUL
 };
@@ -88,8 +88,8 @@ int check_sequence(const unsigned char *s, std::size_t avail, std::size_t length
     return CU_ICONV_OK;
 }
 
-Utf8Check check_utf8(const unsigned char *s, std::size_t size, kx_uint32_t flags) noexcept {
-    Utf8Check result;
+utf8_check check_utf8(const unsigned char *s, std::size_t size, kx_uint32_t flags) noexcept {
+    utf8_check result;
     for (std::size_t i = 0; i < size;) {
         if (s[i] == 0xC0 && i + 1 < size && s[i + 1] == 0x80) {
             if (flags & CU_ICONV_UTF8_STANDARD) {
@@ -113,8 +113,8 @@ Utf8Check check_utf8(const unsigned char *s, std::size_t size, kx_uint32_t flags
 }
 
 // A copy of s with each C0 80 turned into the NUL it stands for.
-MallocPtr<char> decode_encoded_nuls(const char *s, std::size_t &size) noexcept {
-    MallocPtr<char> copy(static_cast<char *>(std::malloc(size != 0 ? size : 1)));
+unique_mem<char> decode_encoded_nuls(const char *s, std::size_t &size) noexcept {
+    unique_mem<char> copy(static_cast<char *>(std::malloc(size != 0 ? size : 1)));
     if (!copy)
         return copy;
     std::size_t n = 0;
@@ -130,22 +130,23 @@ MallocPtr<char> decode_encoded_nuls(const char *s, std::size_t &size) noexcept {
 // Checks what the system iconv wrote as UTF-8: it passes some invalid
 // input through, such as UTF-8 beyond U+10FFFF when both sides are UTF-8.
 int check_utf8_output(const char *s, std::size_t size, kx_uint32_t flags) noexcept {
-    const Utf8Check check = check_utf8(reinterpret_cast<const unsigned char *>(s), size,
-                                       (flags & CU_ICONV_UTF8_BMP_ONLY) | CU_ICONV_UTF8_STANDARD);
+    const utf8_check check = check_utf8(reinterpret_cast<const unsigned char *>(s), size,
+                                        (flags & CU_ICONV_UTF8_BMP_ONLY) | CU_ICONV_UTF8_STANDARD);
     return check.status == CU_ICONV_INCOMPLETE ? CU_ICONV_BAD_SEQUENCE : check.status;
 }
 
 // ---- conversion ------------------------------------------------------------
 
-class LockGuard {
+class mutex_lock {
   public:
-    explicit LockGuard(pthread_mutex_t &m) noexcept : m_(m), locked_(pthread_mutex_lock(&m) == 0) {}
-    ~LockGuard() {
+    explicit mutex_lock(pthread_mutex_t &m) noexcept
+        : m_(m), locked_(pthread_mutex_lock(&m) == 0) {}
+    ~mutex_lock() {
         if (locked_)
             pthread_mutex_unlock(&m_);
     }
-    LockGuard(const LockGuard &) = delete;
-    LockGuard &operator=(const LockGuard &) = delete;
+    mutex_lock(const mutex_lock &) = delete;
+    mutex_lock &operator=(const mutex_lock &) = delete;
     bool locked() const noexcept { return locked_; }
 
   private:
@@ -154,7 +155,7 @@ class LockGuard {
 };
 
 // The output of a conversion, grown as iconv asks for room.
-class Output {
+class conversion_output {
   public:
     bool init(std::size_t input_size) noexcept {
         std::size_t capacity = 0;
@@ -189,7 +190,7 @@ class Output {
         return true;
     }
 
-    MallocPtr<char> buf_;
+    unique_mem<char> buf_;
     std::size_t capacity_ = 0;
     std::size_t used_ = 0;
 };
@@ -211,7 +212,7 @@ int status_of_errno(int err, const cu_iconv_s &h) noexcept {
 
 // Runs one iconv step (in NULL flushes the shift state), growing the output
 // while iconv runs out of room.
-int run_iconv(cu_iconv_s &h, char **in, std::size_t *in_left, Output &out) noexcept {
+int run_iconv(cu_iconv_s &h, char **in, std::size_t *in_left, conversion_output &out) noexcept {
     for (;;) {
         char *next = out.next();
         std::size_t room = out.room();
@@ -227,8 +228,9 @@ int run_iconv(cu_iconv_s &h, char **in, std::size_t *in_left, Output &out) noexc
     }
 }
 
-int convert_locked(cu_iconv_s &h, const char *in, std::size_t size, Output &out) noexcept {
-    const LockGuard guard(h.lock);
+int convert_locked(cu_iconv_s &h, const char *in, std::size_t size,
+                   conversion_output &out) noexcept {
+    const mutex_lock guard(h.lock);
     if (!guard.locked())
         return CU_ICONV_INTERNAL;
     iconv(h.cd, nullptr, nullptr, nullptr, nullptr); // a fresh shift state per text
@@ -240,9 +242,9 @@ int convert_locked(cu_iconv_s &h, const char *in, std::size_t size, Output &out)
 
 int convert(cu_iconv_s &h, const char *in, std::size_t size, char **out,
             std::size_t *out_size) noexcept {
-    MallocPtr<char> decoded;
+    unique_mem<char> decoded;
     if (from_utf8(h)) {
-        const Utf8Check check =
+        const utf8_check check =
             check_utf8(reinterpret_cast<const unsigned char *>(in), size, h.flags);
         if (check.status != CU_ICONV_OK)
             return check.status;
@@ -253,7 +255,7 @@ int convert(cu_iconv_s &h, const char *in, std::size_t size, char **out,
             in = decoded.get();
         }
     }
-    Output output;
+    conversion_output output;
     if (!output.init(size))
         return CU_ICONV_NO_MEMORY;
     const int status = convert_locked(h, in, size, output);
@@ -280,15 +282,15 @@ bool env_is_true(const char *name) noexcept {
                        [value](const char *y) { return cu_strcasecmp_posix_1(value, y) == 0; });
 }
 
-struct Utf8Settings {
+struct utf8_env_settings {
     bool assumed;
     bool standard;
     bool bmp_only;
 };
 
-const Utf8Settings &utf8_settings() noexcept {
+const utf8_env_settings &utf8_settings() noexcept {
     // Read once: the environment may change later, the answers must not.
-    static const Utf8Settings settings = {
+    static const utf8_env_settings settings = {
         env_is_true("KX_CU_UTF8_ASSUMED"),
         env_is_true("KX_CU_UTF8_STANDARD"),
         env_is_true("KX_CU_UTF8_BMP_ONLY"),
@@ -309,15 +311,15 @@ CU_EXTERN int cu_iconv_open_1(const char *codeset, kx_uint32_t flags, cu_iconv_t
     *handle = nullptr;
     // Suffixes such as "//IGNORE" would change what counts as an error.
     if (codeset == nullptr || *codeset == '\0' || std::strchr(codeset, '/') != nullptr ||
-        (flags & ~kOpenFlags) != 0)
+        (flags & ~open_flags) != 0)
         return CU_ICONV_BAD_ARGUMENT;
 
-    MallocPtr<void> memory(std::malloc(sizeof(cu_iconv_s)));
+    kx::unique_mem<void> memory(std::malloc(sizeof(cu_iconv_s)));
     if (!memory)
         return CU_ICONV_NO_MEMORY;
     const bool to_codeset = (flags & CU_ICONV_FROM_UTF8) != 0;
     const iconv_t cd = to_codeset ? iconv_open(codeset, "UTF-8") : iconv_open("UTF-8", codeset);
-    if (cd == kBadIconv)
+    if (cd == bad_iconv)
         return errno == ENOMEM ? CU_ICONV_NO_MEMORY : CU_ICONV_NOT_SUPPORTED;
     *handle = new (memory.release()) cu_iconv_s{cd, PTHREAD_MUTEX_INITIALIZER, flags};
     return CU_ICONV_OK;

@@ -10,7 +10,7 @@ namespace kx::cu {
 namespace {
 
 // Writes text forms into a fixed buffer of CU_IPADDR_TEXT_MAX bytes.
-class TextWriter {
+class text_writer {
   public:
     void put(char c) noexcept { text_[size_++] = c; }
 
@@ -24,13 +24,13 @@ class TextWriter {
 
     // Lowercase, without leading zeros.
     void put_hex(unsigned value) noexcept {
-        static constexpr char kDigits[] = "0123456789abcdef";
+        static constexpr char hex_digits[] = "0123456789abcdef";
         bool started = false;
         for (int shift = 12; shift >= 0; shift -= 4) {
             const unsigned digit = (value >> shift) & 0xF;
             started = started || digit != 0 || shift == 0;
             if (started)
-                put(kDigits[digit]);
+                put(hex_digits[digit]);
         }
     }
 
@@ -56,14 +56,14 @@ class TextWriter {
     std::size_t size_ = 0;
 };
 
-struct ZeroRun {
+struct zero_run {
     int start = -1;
     int length = 0;
 };
 
 // The first longest run of two or more zero groups; start -1 when none.
-ZeroRun longest_zero_run(const unsigned (&groups)[8]) noexcept {
-    ZeroRun best;
+zero_run longest_zero_run(const unsigned (&groups)[8]) noexcept {
+    zero_run best;
     for (int i = 0; i < 8;) {
         int end = i;
         while (end < 8 && groups[end] == 0)
@@ -76,11 +76,11 @@ ZeroRun longest_zero_run(const unsigned (&groups)[8]) noexcept {
 }
 
 bool is_v4_mapped(const unsigned char *b) noexcept {
-    static constexpr unsigned char kPrefix[12] = {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0xff, 0xff};
-    return std::memcmp(b, kPrefix, sizeof kPrefix) == 0;
+    static constexpr unsigned char v4_mapped[12] = {0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0xff, 0xff};
+    return std::memcmp(b, v4_mapped, sizeof v4_mapped) == 0;
 }
 
-void write_ipv6(TextWriter &out, const unsigned char *b) noexcept {
+void write_ipv6(text_writer &out, const unsigned char *b) noexcept {
     if (is_v4_mapped(b)) {
         for (const char c : {':', ':', 'f', 'f', 'f', 'f', ':'})
             out.put(c);
@@ -90,7 +90,7 @@ void write_ipv6(TextWriter &out, const unsigned char *b) noexcept {
     unsigned groups[8];
     for (std::size_t i = 0; i < 8; ++i)
         groups[i] = static_cast<unsigned>(b[2 * i]) << 8 | b[2 * i + 1];
-    const ZeroRun run = longest_zero_run(groups);
+    const zero_run run = longest_zero_run(groups);
     for (int i = 0; i < 8; ++i) {
         if (i == run.start) {
             out.put(':');
@@ -115,7 +115,7 @@ CU_EXTERN int cu_ipaddr_ntop_1(int af, const void *addr, char *dst, size_t size)
     if (addr == nullptr || dst == nullptr)
         return -1;
     const auto *bytes = static_cast<const unsigned char *>(addr);
-    TextWriter out;
+    text_writer out;
     if (af == AF_INET)
         out.put_dotted_quad(bytes);
     else if (af == AF_INET6)

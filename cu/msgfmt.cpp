@@ -12,10 +12,10 @@
 namespace kx::cu {
 namespace {
 
-char s_no_memory_message[] = "There is not enough memory to format the error message.\n";
+char no_memory_message[] = "There is not enough memory to format the error message.\n";
 
 // A growing malloc'd text; every failure is an allocation failure.
-class TextBuffer {
+class text_buffer {
   public:
     bool append(const char *text, std::size_t size) noexcept {
         char *dst = reserve(size);
@@ -59,12 +59,12 @@ class TextBuffer {
     }
 
   private:
-    MallocPtr<char> text_;
+    unique_mem<char> text_;
     std::size_t size_ = 0;
     std::size_t capacity_ = 0;
 };
 
-enum class Outcome { done, unsuitable, no_memory };
+enum class append_outcome { done, unsuitable, no_memory };
 
 bool is_unsigned_conversion(char c) noexcept {
     return c == 'u' || c == 'x' || c == 'X' || c == 'o';
@@ -80,13 +80,13 @@ bool is_double_conversion(char c) noexcept {
 
 // Flags the conversion gives a meaning to; C leaves the others undefined.
 unsigned meaningful_flags(char c) noexcept {
-    unsigned flags = kFlagMinus;
+    unsigned flags = flag_minus;
     if (c == 'd' || c == 'i' || is_double_conversion(c))
-        flags |= kFlagPlus | kFlagSpace;
+        flags |= flag_plus | flag_space;
     if (c == 'o' || c == 'x' || c == 'X' || is_double_conversion(c))
-        flags |= kFlagHash;
+        flags |= flag_hash;
     if (is_integer_conversion(c) || is_double_conversion(c))
-        flags |= kFlagZero;
+        flags |= flag_zero;
     return flags;
 }
 
@@ -104,21 +104,21 @@ char *put_number(char *p, int value) noexcept {
 
 // Size of a one-conversion format: '%', 5 flags, width, '.', precision,
 // length, conversion, NUL.
-constexpr std::size_t kFormatSize = 1 + 5 + 5 + 1 + 5 + 2 + 1 + 1;
+constexpr std::size_t format_size = 1 + 5 + 5 + 1 + 5 + 2 + 1 + 1;
 
 // Writes the snprintf format of ph for an argument of kind arg_kind. The
 // length comes from the argument's kind, so the format always matches it.
-void build_format(const Placeholder &ph, kx_int32_t arg_kind,
-                  char (&format)[kFormatSize]) noexcept {
+void build_format(const placeholder &ph, kx_int32_t arg_kind,
+                  char (&format)[format_size]) noexcept {
     char *p = format;
     *p++ = '%';
     const unsigned flags = ph.flags & meaningful_flags(ph.conversion);
     static constexpr struct {
         unsigned bit;
         char c;
-    } kFlagChars[] = {
-        {kFlagMinus, '-'}, {kFlagPlus, '+'}, {kFlagSpace, ' '}, {kFlagHash, '#'}, {kFlagZero, '0'}};
-    for (const auto &flag : kFlagChars)
+    } flag_chars[] = {
+        {flag_minus, '-'}, {flag_plus, '+'}, {flag_space, ' '}, {flag_hash, '#'}, {flag_zero, '0'}};
+    for (const auto &flag : flag_chars)
         if (flags & flag.bit)
             *p++ = flag.c;
     if (ph.width >= 0)
@@ -127,9 +127,9 @@ void build_format(const Placeholder &ph, kx_int32_t arg_kind,
         *p++ = '.';
         p = put_number(p, ph.precision);
     }
-    if (ph.length == Length::hh || ph.length == Length::h) {
+    if (ph.length == length_modifier::hh || ph.length == length_modifier::h) {
         *p++ = 'h';
-        if (ph.length == Length::hh)
+        if (ph.length == length_modifier::hh)
             *p++ = 'h';
     } else if (arg_kind == CU_ERROR_ARG_LONG) {
         *p++ = 'l';
@@ -141,32 +141,33 @@ void build_format(const Placeholder &ph, kx_int32_t arg_kind,
     *p = '\0';
 }
 
-template <typename T> Outcome append_printf(TextBuffer &out, const char *format, T value) noexcept {
+template <typename T>
+append_outcome append_printf(text_buffer &out, const char *format, T value) noexcept {
     const int size = std::snprintf(nullptr, 0, format, value);
     if (size < 0)
-        return Outcome::unsuitable;
+        return append_outcome::unsuitable;
     char *dst = out.reserve(static_cast<std::size_t>(size));
     if (dst == nullptr)
-        return Outcome::no_memory;
+        return append_outcome::no_memory;
     std::snprintf(dst, static_cast<std::size_t>(size) + 1, format, value);
     out.commit(static_cast<std::size_t>(size));
-    return Outcome::done;
+    return append_outcome::done;
 }
 
 // Integers go to printf with the signedness the conversion reads.
 template <typename Signed>
-Outcome append_integer(TextBuffer &out, const char *format, char conversion,
-                       Signed value) noexcept {
+append_outcome append_integer(text_buffer &out, const char *format, char conversion,
+                              Signed value) noexcept {
     if (is_unsigned_conversion(conversion))
         return append_printf(out, format, static_cast<std::make_unsigned_t<Signed>>(value));
     return append_printf(out, format, value);
 }
 
-Outcome append_argument(TextBuffer &out, const Placeholder &ph,
-                        const cu_error_arg_t &arg) noexcept {
+append_outcome append_argument(text_buffer &out, const placeholder &ph,
+                               const cu_error_arg_t &arg) noexcept {
     if (ph.kind != arg.cu_arg_type)
-        return Outcome::unsuitable;
-    char format[kFormatSize];
+        return append_outcome::unsuitable;
+    char format[format_size];
     build_format(ph, arg.cu_arg_type, format);
     const auto &value = arg.cu_arg_value;
     switch (arg.cu_arg_type) {
@@ -185,7 +186,7 @@ Outcome append_argument(TextBuffer &out, const Placeholder &ph,
     case CU_ERROR_ARG_VOID_PTR:
         return append_printf(out, format, value.cu_arg_void_ptr);
     default:
-        return Outcome::unsuitable;
+        return append_outcome::unsuitable;
     }
 }
 
@@ -197,39 +198,39 @@ const cu_error_arg_t *find_argument(const cu_error_t &err, unsigned number) noex
 
 // The message text with its placeholders replaced; NULL on no memory.
 char *format_message(const char *text, const cu_error_t &err) noexcept {
-    TextBuffer out;
-    PlaceholderScanner scanner(text);
-    for (Piece piece; scanner.next(piece);) {
-        Outcome outcome = Outcome::unsuitable;
+    text_buffer out;
+    placeholder_scanner scanner(text);
+    for (text_piece piece; scanner.next(piece);) {
+        append_outcome outcome = append_outcome::unsuitable;
         if (piece.is_placeholder) {
             if (const cu_error_arg_t *arg = find_argument(err, piece.ph.number))
                 outcome = append_argument(out, piece.ph, *arg);
         }
-        if (outcome == Outcome::unsuitable && !out.append(piece.text, piece.size))
-            outcome = Outcome::no_memory;
-        if (outcome == Outcome::no_memory)
+        if (outcome == append_outcome::unsuitable && !out.append(piece.text, piece.size))
+            outcome = append_outcome::no_memory;
+        if (outcome == append_outcome::no_memory)
             return nullptr;
     }
     return out.release();
 }
 
-struct CatalogueCloser {
+struct catalogue_closer {
     void operator()(nl_catd catd) const noexcept { catclose(catd); }
 };
-using Catalogue = std::unique_ptr<std::remove_pointer_t<nl_catd>, CatalogueCloser>;
+using unique_catalogue = std::unique_ptr<std::remove_pointer_t<nl_catd>, catalogue_closer>;
 
-Catalogue open_catalogue(const char *name) noexcept {
+unique_catalogue open_catalogue(const char *name) noexcept {
     if (name == nullptr || *name == '\0')
         return nullptr;
     const nl_catd catd = catopen(name, NL_CAT_LOCALE);
     // catopen's failure value, which the interface defines as (nl_catd)-1.
     const nl_catd failed = reinterpret_cast<nl_catd>(-1); // NOLINT(performance-no-int-to-ptr)
-    return Catalogue(catd == failed ? nullptr : catd);
+    return unique_catalogue(catd == failed ? nullptr : catd);
 }
 
 char *format_record(const cu_error_t &err) noexcept {
     const char *fallback = err.cu_msg_default != nullptr ? err.cu_msg_default : "";
-    const Catalogue catalogue = open_catalogue(err.cu_msg_cat);
+    const unique_catalogue catalogue = open_catalogue(err.cu_msg_cat);
     // The catalogue's text lives until catclose, so it is formatted first.
     const char *text =
         catalogue ? catgets(catalogue.get(), err.cu_msg_set, err.cu_msg_num, fallback) : fallback;
@@ -251,11 +252,11 @@ CU_EXTERN void cu_get_errmsg_1(const cu_error_t *err, char **msg) {
     if (msg == nullptr)
         return;
     char *text = err != nullptr ? format_record(*err) : empty_text();
-    *msg = text != nullptr ? text : s_no_memory_message;
+    *msg = text != nullptr ? text : no_memory_message;
 }
 
 CU_EXTERN void cu_rel_errmsg_1(char *msg) {
-    if (msg != s_no_memory_message)
+    if (msg != no_memory_message)
         std::free(msg);
 }
 

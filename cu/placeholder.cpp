@@ -24,48 +24,48 @@ int read_number(const char *&p, int limit) noexcept {
 unsigned flag_bit(char c) noexcept {
     switch (c) {
     case '-':
-        return kFlagMinus;
+        return flag_minus;
     case '+':
-        return kFlagPlus;
+        return flag_plus;
     case ' ':
-        return kFlagSpace;
+        return flag_space;
     case '#':
-        return kFlagHash;
+        return flag_hash;
     case '0':
-        return kFlagZero;
+        return flag_zero;
     default:
         return 0;
     }
 }
 
-Length read_length(const char *&p) noexcept {
+length_modifier read_length(const char *&p) noexcept {
     switch (*p) {
     case 'h':
         ++p;
         if (*p != 'h')
-            return Length::h;
+            return length_modifier::h;
         ++p;
-        return Length::hh;
+        return length_modifier::hh;
     case 'l':
         ++p;
         if (*p != 'l')
-            return Length::l;
+            return length_modifier::l;
         ++p;
-        return Length::ll;
+        return length_modifier::ll;
     case 'z':
         ++p;
-        return Length::z;
+        return length_modifier::z;
     case 'j':
         ++p;
-        return Length::j;
+        return length_modifier::j;
     case 't':
         ++p;
-        return Length::t;
+        return length_modifier::t;
     case 'L':
         ++p;
-        return Length::L;
+        return length_modifier::L;
     default:
-        return Length::none;
+        return length_modifier::none;
     }
 }
 
@@ -79,33 +79,33 @@ template <typename T> constexpr kx_int32_t integer_kind() noexcept {
         return CU_ERROR_ARG_LONG_LONG;
 }
 
-constexpr kx_int32_t kNoKind = -1;
+constexpr kx_int32_t no_kind = -1;
 
-kx_int32_t integer_kind_of(Length length) noexcept {
+kx_int32_t integer_kind_of(length_modifier length) noexcept {
     switch (length) {
-    case Length::none:
-    case Length::hh:
-    case Length::h:
+    case length_modifier::none:
+    case length_modifier::hh:
+    case length_modifier::h:
         return CU_ERROR_ARG_INT; // narrower values travel as int
-    case Length::l:
+    case length_modifier::l:
         return CU_ERROR_ARG_LONG;
-    case Length::ll:
+    case length_modifier::ll:
         return CU_ERROR_ARG_LONG_LONG;
-    case Length::z:
+    case length_modifier::z:
         return integer_kind<std::size_t>();
-    case Length::j:
+    case length_modifier::j:
         return integer_kind<std::intmax_t>();
-    case Length::t:
+    case length_modifier::t:
         return integer_kind<std::ptrdiff_t>();
-    case Length::L:
+    case length_modifier::L:
         break;
     }
-    return kNoKind;
+    return no_kind;
 }
 
-// The argument kind a conversion formats, or kNoKind when the conversion (or
+// The argument kind a conversion formats, or no_kind when the conversion (or
 // its pairing with the length) is not one that messages may use.
-kx_int32_t kind_of(char conversion, Length length) noexcept {
+kx_int32_t kind_of(char conversion, length_modifier length) noexcept {
     switch (conversion) {
     case 'd':
     case 'i':
@@ -115,32 +115,33 @@ kx_int32_t kind_of(char conversion, Length length) noexcept {
     case 'o':
         return integer_kind_of(length);
     case 'c':
-        return length == Length::none ? CU_ERROR_ARG_INT : kNoKind;
+        return length == length_modifier::none ? CU_ERROR_ARG_INT : no_kind;
     case 'f':
     case 'e':
     case 'g':
         // A long double argument is stored as a double.
-        return length == Length::none || length == Length::l || length == Length::L
+        return length == length_modifier::none || length == length_modifier::l ||
+                       length == length_modifier::L
                    ? CU_ERROR_ARG_DOUBLE
-                   : kNoKind;
+                   : no_kind;
     case 's':
-        return length == Length::none ? CU_ERROR_ARG_CHAR_STR : kNoKind;
+        return length == length_modifier::none ? CU_ERROR_ARG_CHAR_STR : no_kind;
     case 'p':
-        return length == Length::none ? CU_ERROR_ARG_VOID_PTR : kNoKind;
+        return length == length_modifier::none ? CU_ERROR_ARG_VOID_PTR : no_kind;
     default:
-        return kNoKind;
+        return no_kind;
     }
 }
 
 // Parses the placeholder whose '%' is at start. Returns its size in bytes,
 // or 0 when the text there is not a placeholder. Never reads past the NUL.
-std::size_t parse_placeholder(const char *start, Placeholder &ph) noexcept {
+std::size_t parse_placeholder(const char *start, placeholder &ph) noexcept {
     const char *p = start + 1;
     if (is_digit(*p)) {
         const char *digits = p;
-        const int number = read_number(p, static_cast<int>(kMaxArgs));
+        const int number = read_number(p, static_cast<int>(max_args));
         if (*p == '$') {
-            if (number < 1 || number > static_cast<int>(kMaxArgs))
+            if (number < 1 || number > static_cast<int>(max_args))
                 return 0;
             ph.number = static_cast<unsigned>(number);
             ++p;
@@ -151,19 +152,19 @@ std::size_t parse_placeholder(const char *start, Placeholder &ph) noexcept {
     for (unsigned bit; (bit = flag_bit(*p)) != 0; ++p)
         ph.flags |= bit;
     if (is_digit(*p)) {
-        ph.width = read_number(p, kMaxField);
-        if (ph.width > kMaxField)
+        ph.width = read_number(p, max_field);
+        if (ph.width > max_field)
             return 0;
     }
     if (*p == '.') {
         ++p;
-        ph.precision = read_number(p, kMaxField);
-        if (ph.precision > kMaxField)
+        ph.precision = read_number(p, max_field);
+        if (ph.precision > max_field)
             return 0;
     }
     ph.length = read_length(p);
     const kx_int32_t kind = kind_of(*p, ph.length);
-    if (kind == kNoKind)
+    if (kind == no_kind)
         return 0;
     ph.conversion = *p;
     ph.kind = kind;
@@ -172,11 +173,11 @@ std::size_t parse_placeholder(const char *start, Placeholder &ph) noexcept {
 
 } // namespace
 
-bool PlaceholderScanner::next(Piece &piece) noexcept {
+bool placeholder_scanner::next(text_piece &piece) noexcept {
     const char *p = next_;
     if (*p == '\0')
         return false;
-    piece = Piece{};
+    piece = text_piece{};
     piece.text = p;
     if (*p != '%') {
         piece.size = std::strcspn(p, "%");
@@ -186,11 +187,11 @@ bool PlaceholderScanner::next(Piece &piece) noexcept {
         next_ = p + 2;
         return true;
     } else if (const std::size_t size = parse_placeholder(p, piece.ph); size == 0) {
-        piece.ph = Placeholder{};
+        piece.ph = placeholder{};
         piece.size = 1; // a lone '%' is text; scanning resumes after it
     } else {
         piece.size = size;
-        if (piece.ph.number == 0 && unnumbered_ < kMaxArgs)
+        if (piece.ph.number == 0 && unnumbered_ < max_args)
             piece.ph.number = ++unnumbered_;
         piece.is_placeholder = piece.ph.number != 0;
     }

@@ -7,7 +7,7 @@
 
 namespace {
 
-constexpr kx_uint64_t kNanosPerSecond = 1000000000;
+constexpr kx_uint64_t nanos_per_second = 1000000000;
 
 } // namespace
 
@@ -16,14 +16,14 @@ extern "C" {
 CU_EXTERN kx_uint64_t cu_get_ctr_1(void) {
     timespec now{};
     clock_gettime(CLOCK_MONOTONIC, &now); // cannot fail for this clock
-    return static_cast<kx_uint64_t>(now.tv_sec) * kNanosPerSecond +
+    return static_cast<kx_uint64_t>(now.tv_sec) * nanos_per_second +
            static_cast<kx_uint64_t>(now.tv_nsec);
 }
 
 CU_EXTERN void cu_get_procspeed_1(cu_timeinfo_t *info) {
     if (info == nullptr)
         return;
-    info->timeinfo1 = kNanosPerSecond;
+    info->timeinfo1 = nanos_per_second;
     info->timeinfo2 = 0;
 }
 
@@ -37,7 +37,7 @@ CU_EXTERN void cu_cvt_time_1(kx_uint64_t counter, const cu_timeinfo_t *info, kx_
         // The remainder is below ticks_per_second, so 128 bits hold the
         // product for any time base.
         const unsigned __int128 rest = counter % ticks_per_second;
-        nanos = static_cast<kx_uint64_t>(rest * kNanosPerSecond / ticks_per_second);
+        nanos = static_cast<kx_uint64_t>(rest * nanos_per_second / ticks_per_second);
     }
     if (seconds != nullptr)
         *seconds = whole > INT64_MAX ? INT64_MAX : static_cast<kx_int64_t>(whole);

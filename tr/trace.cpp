@@ -13,20 +13,20 @@
 #include <cstring>
 #include <ctime>
 #include <iterator>
-#include <memory>
 #include <new>
 #include <optional>
 #include <span>
-#include <string>
 #include <string_view>
-#include <utility>
-#include <vector>
 
 #include <fcntl.h>
 #include <pthread.h>
 #include <unistd.h>
 
+#include "unique_mem.h"
+
 namespace {
+
+using kx::unique_mem;
 
 constexpr kx_uint32_t highest_level = 9;
 
@@ -52,12 +52,23 @@ bool equal_ignoring_case(std::string_view a, std::string_view b) {
                       [](char x, char y) { return ascii_lower(x) == ascii_lower(y); });
 }
 
+// The text before position end, all of it when end is npos. Unlike substr,
+// these have no exception path.
+std::string_view before(std::string_view text, std::size_t end) noexcept {
+    return {text.data(), std::min(end, text.size())};
+}
+
+// The text after the separator at position at.
+std::string_view after(std::string_view text, std::size_t at) noexcept {
+    return {text.data() + at + 1, text.size() - at - 1};
+}
+
 std::string_view trim_blanks(std::string_view text) {
     const auto first = text.find_first_not_of(" \t");
     if (first == std::string_view::npos)
         return {};
     const auto last = text.find_last_not_of(" \t");
-    return text.substr(first, last - first + 1);
+    return {text.data() + first, last - first + 1};
 }
 
 // A component name is one field of a record line: a blank or a control
@@ -81,25 +92,27 @@ tr_detail_level_t clamp_level(kx_uint32_t level, kx_uint32_t minimum) {
 // Registry
 
 struct category {
-    std::string name;
+    const char *name;
     kx_uint32_t id;
     kx_uint32_t minimum;
 };
 
+// A registered component: one malloc'd block holds this record, its
+// categories and the copies of all their names.
 struct component {
-    std::string name;
+    const char *name;
     tr_detail_level_t *levels;
-    std::vector<category> categories;
+    std::span<const category> categories;
 };
 
-bool selects_all(std::string_view selector) {
+bool selects_all(std::string_view selector) noexcept {
     return selector == "*" || equal_ignoring_case(selector, "all");
 }
 
 // Calls apply for each category that selector names: its name, ignoring
 // case, or "*" or "all" for all. Returns whether any was named.
 template <typename Apply>
-bool for_each_selected(const component &c, std::string_view selector, Apply &&apply) {
+bool for_each_selected(const component &c, std::string_view selector, Apply &&apply) noexcept {
     if (selector.empty())
         return false;
     bool any = false;
@@ -123,78 +136,181 @@ class registry_lock {
     registry_lock &operator=(const registry_lock &) = delete;
 };
 
-// Never destroyed: components may unregister from their own static
-// destructors, after ours would have run.
-std::vector<component> &registered_components() {
-    alignas(std::vector<component>) static unsigned char storage[sizeof(std::vector<component>)];
-    static auto *const components = new (storage) std::vector<component>;
-    return *components;
+// The registered components, under registry_mutex. Trivially destructible:
+// components may unregister from their own static destructors, after ours
+// would have run.
+struct component_registry {
+    component **items = nullptr; // malloc'd
+    std::size_t count = 0;
+    std::size_t capacity = 0;
+};
+component_registry registry;
+
+component *find_component(std::string_view name) noexcept {
+    for (std::size_t i = 0; i < registry.count; ++i)
+        if (registry.items[i]->name == name)
+            return registry.items[i];
+    return nullptr;
 }
 
-component *find_component(std::string_view name) {
-    auto &all = registered_components();
-    auto it =
-        std::find_if(all.begin(), all.end(), [&](const component &c) { return c.name == name; });
-    return it == all.end() ? nullptr : &*it;
+// Room for one more component, so that adding it cannot fail.
+bool reserve_component() noexcept {
+    if (registry.count < registry.capacity)
+        return true;
+    const std::size_t capacity = registry.capacity == 0 ? 8 : 2 * registry.capacity;
+    void *grown = std::realloc(registry.items, capacity * sizeof *registry.items);
+    if (!grown)
+        return false;
+    registry.items = static_cast<component **>(grown);
+    registry.capacity = capacity;
+    return true;
 }
 
-bool descriptions_are_valid(std::span<const tr_category_description_t> descriptions) {
+void remove_component(const component *c) noexcept {
+    component **end = registry.items + registry.count;
+    component **found = std::find(registry.items, end, c);
+    std::free(*found);
+    std::copy(found + 1, end, found);
+    --registry.count;
+}
+
+bool descriptions_are_valid(std::span<const tr_category_description_t> descriptions) noexcept {
     return std::all_of(descriptions.begin(), descriptions.end(), [&](const auto &d) {
         return d.category_name && d.category_id < descriptions.size();
     });
 }
 
-component describe_component(const char *name, tr_detail_level_t *levels,
-                             std::span<const tr_category_description_t> descriptions) {
-    component c{name, levels, {}};
-    c.categories.reserve(descriptions.size());
+bool add_size(std::size_t &total, std::size_t more) noexcept {
+    return !__builtin_add_overflow(total, more, &total);
+}
+
+constexpr std::size_t categories_offset =
+    (sizeof(component) + alignof(category) - 1) / alignof(category) * alignof(category);
+
+// Bytes of the block that describe_component fills; 0 when that overflows.
+std::size_t component_size(const char *name,
+                           std::span<const tr_category_description_t> descriptions) noexcept {
+    std::size_t total = categories_offset;
+    std::size_t categories_size = 0;
+    if (__builtin_mul_overflow(descriptions.size(), sizeof(category), &categories_size) ||
+        !add_size(total, categories_size) || !add_size(total, std::strlen(name) + 1))
+        return 0;
     for (const auto &d : descriptions)
-        c.categories.push_back({d.category_name, d.category_id, d.minimum_level_of_detail});
+        if (!add_size(total, std::strlen(d.category_name) + 1))
+            return 0;
+    return total;
+}
+
+// Copies a text to next and moves next past its NUL.
+const char *copy_text(char *&next, const char *text) noexcept {
+    const std::size_t size = std::strlen(text) + 1;
+    const char *copy = static_cast<const char *>(std::memcpy(next, text, size));
+    next += size;
+    return copy;
+}
+
+// The component as the registry keeps it, or NULL when memory runs out.
+unique_mem<component>
+describe_component(const char *name, tr_detail_level_t *levels,
+                   std::span<const tr_category_description_t> descriptions) noexcept {
+    const std::size_t size = component_size(name, descriptions);
+    unique_mem<component> c(static_cast<component *>(size ? std::malloc(size) : nullptr));
+    if (!c)
+        return c;
+    char *block = reinterpret_cast<char *>(c.get());
+    auto *categories = reinterpret_cast<category *>(block + categories_offset);
+    char *texts = reinterpret_cast<char *>(categories + descriptions.size());
+    new (c.get()) component{copy_text(texts, name), levels, {categories, descriptions.size()}};
+    for (std::size_t i = 0; i < descriptions.size(); ++i) {
+        const auto &d = descriptions[i];
+        new (&categories[i])
+            category{copy_text(texts, d.category_name), d.category_id, d.minimum_level_of_detail};
+    }
     return c;
 }
 
 // ---------------------------------------------------------------------------
 // KX_TRACE_LEVELS, e.g. "_SEL:API=8,Perf=2;_XYZ:all=1"
 
+// A growing malloc'd text. An allocation failure marks it failed, and later
+// appends do nothing.
+class text_builder {
+  public:
+    void append(std::string_view s) noexcept {
+        if (failed_ || !reserve(s.size()))
+            return;
+        std::memcpy(text_.get() + size_, s.data(), s.size());
+        size_ += s.size();
+    }
+    void append(char c) noexcept { append(std::string_view(&c, 1)); }
+    void append_quoted(std::string_view s) noexcept {
+        append('"');
+        append(s);
+        append('"');
+    }
+    std::size_t size() const noexcept { return size_; }
+    bool failed() const noexcept { return failed_; }
+    std::string_view text() const noexcept { return {text_.get(), size_}; }
+
+  private:
+    bool reserve(std::size_t more) noexcept {
+        std::size_t need = 0;
+        if (__builtin_add_overflow(size_, more, &need)) {
+            failed_ = true;
+            return false;
+        }
+        if (need <= capacity_)
+            return true;
+        std::size_t capacity = capacity_ < 128 ? 128 : capacity_;
+        while (capacity < need && !__builtin_mul_overflow(capacity, std::size_t{2}, &capacity))
+            ;
+        void *grown = capacity >= need ? std::realloc(text_.get(), capacity) : nullptr;
+        if (!grown) {
+            failed_ = true;
+            return false;
+        }
+        (void)text_.release();
+        text_.reset(static_cast<char *>(grown));
+        capacity_ = capacity;
+        return true;
+    }
+
+    unique_mem<char> text_;
+    std::size_t size_ = 0;
+    std::size_t capacity_ = 0;
+    bool failed_ = false;
+};
+
 // Warnings about the configuration go to standard error, a few at most, so
 // that a long mistaken setting cannot flood a daemon's log.
 constexpr int max_warnings = 8;
 std::atomic<int> warnings_given{0};
 
-// A warning that cannot be made or written is given up: it must never fail
-// the registration it comes from.
-void warn(const std::string &what) noexcept {
+// compose(text_builder &) writes what is wrong. A warning that cannot be
+// made or written is given up: it must never fail the registration it
+// comes from.
+template <typename Compose> void warn(Compose &&compose) noexcept {
     const int given = warnings_given.fetch_add(1);
     if (given > max_warnings)
         return;
-    try {
-        const std::string line = given == max_warnings
-                                     ? "kx_tr: KX_TRACE_LEVELS: further mistakes not shown\n"
-                                     : "kx_tr: KX_TRACE_LEVELS: " + what + "\n";
-        // One write, so that the line stays whole beside other output.
-        if (write(STDERR_FILENO, line.data(), line.size()) < 0)
-            return;
-    } catch (...) {
-    }
-}
-
-// Built by appending: gcc 12 at -O3 takes a one-letter literal before a
-// std::string for an overlapping copy (-Wrestrict).
-std::string quoted(std::string_view text) {
-    std::string q;
-    q.reserve(text.size() + 2);
-    q += '"';
-    q += text;
-    q += '"';
-    return q;
+    text_builder line;
+    line.append("kx_tr: KX_TRACE_LEVELS: ");
+    if (given == max_warnings)
+        line.append("further mistakes not shown");
+    else
+        compose(line);
+    line.append('\n');
+    // One write, so that the line stays whole beside other output.
+    if (line.failed() || write(STDERR_FILENO, line.text().data(), line.size()) < 0)
+        return;
 }
 
 // Calls visit for each field of text separated by separator, empty ones too.
 template <typename Visit>
-void for_each_field(std::string_view text, char separator, Visit &&visit) {
+void for_each_field(std::string_view text, char separator, Visit &&visit) noexcept {
     for (;;) {
         const auto end = text.find(separator);
-        visit(text.substr(0, end));
+        visit(before(text, end));
         if (end == std::string_view::npos)
             return;
         text.remove_prefix(end + 1);
@@ -202,7 +318,7 @@ void for_each_field(std::string_view text, char separator, Visit &&visit) {
 }
 
 // A level is decimal digits; anything above 9 saturates (and is clamped later).
-std::optional<kx_uint32_t> parse_level(std::string_view text) {
+std::optional<kx_uint32_t> parse_level(std::string_view text) noexcept {
     text = trim_blanks(text);
     if (text.empty())
         return std::nullopt;
@@ -215,21 +331,37 @@ std::optional<kx_uint32_t> parse_level(std::string_view text) {
     return level;
 }
 
-// What is wrong with one "category=level" setting, or "" when nothing is.
-std::string setting_mistake(std::string_view setting) {
+enum class setting_mistake { none, no_level, no_category, bad_level };
+
+// What is wrong with one "category=level" setting.
+setting_mistake mistake_of(std::string_view setting) noexcept {
     const auto equals = setting.find('=');
     if (equals == std::string_view::npos)
-        return quoted(setting) + " has no \"=LEVEL\"";
-    if (trim_blanks(setting.substr(0, equals)).empty())
-        return quoted(setting) + " names no category";
-    if (!parse_level(setting.substr(equals + 1)))
-        return "the level of " + quoted(setting) + " is not a number from 0 to 9";
-    return {};
+        return setting_mistake::no_level;
+    if (trim_blanks(before(setting, equals)).empty())
+        return setting_mistake::no_category;
+    if (!parse_level(after(setting, equals)))
+        return setting_mistake::bad_level;
+    return setting_mistake::none;
+}
+
+void warn_about_setting(std::string_view setting, setting_mistake mistake) noexcept {
+    warn([&](text_builder &line) {
+        if (mistake == setting_mistake::bad_level)
+            line.append("the level of ");
+        line.append_quoted(setting);
+        if (mistake == setting_mistake::no_level)
+            line.append(" has no \"=LEVEL\"");
+        else if (mistake == setting_mistake::no_category)
+            line.append(" names no category");
+        else
+            line.append(" is not a number from 0 to 9");
+    });
 }
 
 // Warns once per process about each part of the configuration that cannot
 // be read, whichever component it names; the parts are then ignored.
-void check_configuration(std::string_view configured) {
+void check_configuration(std::string_view configured) noexcept {
     static std::atomic<bool> checked{false};
     if (checked.exchange(true))
         return;
@@ -237,85 +369,109 @@ void check_configuration(std::string_view configured) {
         if (trim_blanks(entry).empty())
             return;
         const auto colon = entry.find(':');
-        if (colon == std::string_view::npos || trim_blanks(entry.substr(0, colon)).empty())
-            return warn(quoted(trim_blanks(entry)) +
-                        " names no component (write COMPONENT:CATEGORY=LEVEL,...)");
-        for_each_field(entry.substr(colon + 1), ',', [&](std::string_view setting) {
-            if (trim_blanks(setting).empty())
+        if (colon == std::string_view::npos || trim_blanks(before(entry, colon)).empty())
+            return warn([&](text_builder &line) {
+                line.append_quoted(trim_blanks(entry));
+                line.append(" names no component (write COMPONENT:CATEGORY=LEVEL,...)");
+            });
+        for_each_field(after(entry, colon), ',', [&](std::string_view setting) {
+            setting = trim_blanks(setting);
+            if (setting.empty())
                 return;
-            if (auto mistake = setting_mistake(trim_blanks(setting)); !mistake.empty())
-                warn(mistake);
+            if (const setting_mistake mistake = mistake_of(setting);
+                mistake != setting_mistake::none)
+                warn_about_setting(setting, mistake);
         });
     });
 }
 
-std::string category_list(const component &c) {
-    std::string names;
-    for (const category &cat : c.categories)
-        names += (names.empty() ? "" : ", ") + cat.name;
-    return names;
+void warn_about_category(const component &c, std::string_view name) noexcept {
+    warn([&](text_builder &line) {
+        line.append("no category ");
+        line.append_quoted(name);
+        line.append(" in ");
+        line.append(c.name);
+        line.append(" (");
+        const std::size_t list_start = line.size();
+        for (const category &cat : c.categories) {
+            if (line.size() != list_start)
+                line.append(", ");
+            line.append(cat.name);
+        }
+        line.append(", or all)");
+    });
 }
 
 // Applies one "category=level" setting; a malformed one changes nothing,
 // and a category that c does not have is warned about.
 template <typename Apply>
-void apply_setting(const component &c, std::string_view setting, Apply &&apply) {
-    if (!setting_mistake(setting).empty())
+void apply_setting(const component &c, std::string_view setting, Apply &&apply) noexcept {
+    if (mistake_of(setting) != setting_mistake::none)
         return;
     const auto equals = setting.find('=');
-    const auto level = parse_level(setting.substr(equals + 1));
-    const auto name = trim_blanks(setting.substr(0, equals));
+    const auto level = parse_level(after(setting, equals));
+    const auto name = trim_blanks(before(setting, equals));
     if (!for_each_selected(c, name, [&](const category &cat) { apply(cat, *level); }))
-        warn("no category " + quoted(name) + " in " + c.name + " (" + category_list(c) +
-             ", or all)");
+        warn_about_category(c, name);
 }
 
 // Calls apply(category, level) for each setting of component c, in order.
-template <typename Apply> void for_each_configured_level(const component &c, Apply &&apply) {
+template <typename Apply>
+void for_each_configured_level(const component &c, Apply &&apply) noexcept {
     const char *configured = std::getenv("KX_TRACE_LEVELS");
     if (!configured)
         return;
     check_configuration(configured);
     for_each_field(configured, ';', [&](std::string_view entry) {
         const auto colon = entry.find(':');
-        if (colon == std::string_view::npos || trim_blanks(entry.substr(0, colon)) != c.name)
+        if (colon == std::string_view::npos || trim_blanks(before(entry, colon)) != c.name)
             return;
-        for_each_field(entry.substr(colon + 1), ',',
+        for_each_field(after(entry, colon), ',',
                        [&](std::string_view setting) { apply_setting(c, setting, apply); });
     });
 }
 
-// The levels at registration: defaults, then the configured settings. A
-// level no category describes (duplicate ids leave one) starts at 0.
-std::vector<tr_detail_level_t>
-initial_levels(const component &c, std::span<const tr_category_description_t> descriptions) {
-    std::vector<tr_detail_level_t> levels(descriptions.size(), 0);
+// The levels at registration: defaults, then the configured settings; NULL
+// when memory runs out. A level no category describes (duplicate ids leave
+// one) starts at 0.
+unique_mem<tr_detail_level_t>
+initial_levels(const component &c,
+               std::span<const tr_category_description_t> descriptions) noexcept {
+    unique_mem<tr_detail_level_t> levels(static_cast<tr_detail_level_t *>(
+        std::calloc(descriptions.size(), sizeof(tr_detail_level_t))));
+    if (!levels)
+        return levels;
     for (const auto &d : descriptions)
-        levels[d.category_id] = clamp_level(d.default_level_of_detail, d.minimum_level_of_detail);
+        levels.get()[d.category_id] =
+            clamp_level(d.default_level_of_detail, d.minimum_level_of_detail);
     for_each_configured_level(c, [&](const category &cat, kx_uint32_t level) {
-        levels[cat.id] = clamp_level(level, cat.minimum);
+        levels.get()[cat.id] = clamp_level(level, cat.minimum);
     });
     return levels;
 }
 
 // Clients read their levels at trace points without any lock.
-void store_level(tr_detail_level_t *levels, kx_uint32_t index, tr_detail_level_t level) {
+void store_level(tr_detail_level_t *levels, kx_uint32_t index, tr_detail_level_t level) noexcept {
     __atomic_store_n(&levels[index], level, __ATOMIC_RELAXED);
 }
 
 int register_component(const char *name, tr_detail_level_t *levels,
-                       std::span<const tr_category_description_t> descriptions) {
-    component c = describe_component(name, levels, descriptions);
-    const auto initial = initial_levels(c, descriptions);
+                       std::span<const tr_category_description_t> descriptions) noexcept {
+    unique_mem<component> c = describe_component(name, levels, descriptions);
+    if (!c)
+        return TR_NO_MEMORY;
+    const unique_mem<tr_detail_level_t> initial = initial_levels(*c, descriptions);
+    if (!initial)
+        return TR_NO_MEMORY;
     registry_lock lock;
     if (find_component(name))
         return TR_ALREADY_REGISTERED;
-    auto &all = registered_components();
     // Reserve first so that nothing fails after the levels are written.
-    all.reserve(all.size() + 1);
-    for (kx_uint32_t i = 0; i < initial.size(); ++i)
-        store_level(levels, i, initial[i]);
-    all.push_back(std::move(c));
+    if (!reserve_component())
+        return TR_NO_MEMORY;
+    for (kx_uint32_t i = 0; i < descriptions.size(); ++i)
+        store_level(levels, i, initial.get()[i]);
+    registry.items[registry.count++] = c.release();
     return TR_OK;
 }
 
@@ -337,7 +493,7 @@ struct trace_file {
     int fd;          // -1 if it could not be opened
 };
 
-trace_file open_trace_file() {
+trace_file open_trace_file() noexcept {
     const char *path = std::getenv("KX_TRACE_FILE");
     if (!path || !*path)
         return {false, -1};
@@ -352,7 +508,7 @@ trace_file open_trace_file() {
 }
 
 // Opened once, at the first record, and kept open for the process's life.
-const trace_file &the_trace_file() {
+const trace_file &the_trace_file() noexcept {
     static const trace_file file = open_trace_file();
     return file;
 }
@@ -464,10 +620,10 @@ int write_record(std::string_view component, kx_uint32_t id, std::span<const dat
     if (!size)
         return TR_WRITE_FAILED;
     std::array<char, stack_record_size> stack_buffer;
-    std::unique_ptr<char[]> heap_buffer;
+    unique_mem<char> heap_buffer;
     char *buffer = stack_buffer.data();
     if (*size > stack_buffer.size()) {
-        heap_buffer.reset(new (std::nothrow) char[*size]);
+        heap_buffer.reset(static_cast<char *>(std::malloc(*size)));
         if (!heap_buffer)
             return TR_WRITE_FAILED;
         buffer = heap_buffer.get();
@@ -487,12 +643,7 @@ TR_EXTERN int tr_register_component_1(const char *component, tr_detail_level_t *
     const std::span<const tr_category_description_t> descriptions(categories, count);
     if (!descriptions_are_valid(descriptions))
         return TR_BAD_ARGUMENT;
-    try {
-        return register_component(component, levels, descriptions);
-    } catch (...) {
-        // Only allocations can fail here.
-        return TR_NO_MEMORY;
-    }
+    return register_component(component, levels, descriptions);
 }
 
 TR_EXTERN int tr_unregister_component_1(const char *component) noexcept {
@@ -500,11 +651,10 @@ TR_EXTERN int tr_unregister_component_1(const char *component) noexcept {
     if (!component)
         return TR_BAD_ARGUMENT;
     registry_lock lock;
-    auto &all = registered_components();
     const auto *found = find_component(component);
     if (!found)
         return TR_NOT_REGISTERED;
-    all.erase(all.begin() + (found - all.data()));
+    remove_component(found);
     return TR_OK;
 }
 

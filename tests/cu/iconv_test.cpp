@@ -4,32 +4,33 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <map>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
-#include "cu_test_util.h"
-
-using cu_test::IconvPtr;
+#include "cu_test.h"
 
 namespace {
 
-const std::string kNul(1, '\0');
+using cu_test::unique_iconv;
 
-IconvPtr open_converter(const char *codeset, kx_uint32_t flags) {
-    cu_iconv_t h = nullptr;
-    EXPECT_EQ(cu_iconv_open_1(codeset, flags, &h), CU_ICONV_OK) << codeset;
-    return IconvPtr(h);
-}
+const std::string nul(1, '\0');
 
-struct Result {
+struct result {
     int status;
     std::string bytes; // the output, as counted by out_length
+    bool operator==(const result &) const = default;
 };
+
+void PrintTo(const result &r, std::ostream *out) {
+    *out << r.status << " " << ::testing::PrintToString(r.bytes);
+}
 
 // Converts bytes, NULs included. The outputs start as sentinels so that a
 // failure can be checked to leave them alone.
-Result convert(cu_iconv_t h, const std::string &bytes) {
+result convert(cu_iconv_t h, const std::string &bytes) {
     char sentinel = 0;
     char *out = &sentinel;
     size_t out_length = 12345;
@@ -39,95 +40,84 @@ Result convert(cu_iconv_t h, const std::string &bytes) {
         EXPECT_TRUE(out == &sentinel && out_length == 12345u) << "outputs changed on failure";
         return {status, {}};
     }
-    const cu_test::MallocText owned(out);
+    const kx::unique_mem<char> owned(out);
     return {status, std::string(out, out_length)};
 }
 
-TEST(IconvTest, Latin1AndUtf8RoundTrip) {
-    IconvPtr to = open_converter("ISO-8859-1", CU_ICONV_TO_UTF8);
-    IconvPtr from = open_converter("ISO-8859-1", CU_ICONV_FROM_UTF8);
-    EXPECT_EQ(convert(to.get(), "caf\xE9" + kNul).bytes, "caf\xC3\xA9" + kNul);
-    EXPECT_EQ(convert(from.get(), "caf\xC3\xA9" + kNul).bytes, "caf\xE9" + kNul);
-    EXPECT_EQ(convert(to.get(), "\xE9").bytes, "\xC3\xA9"); // no terminator in, none out
-    const Result empty = convert(to.get(), "");
-    EXPECT_EQ(empty.status, CU_ICONV_OK);
-    EXPECT_EQ(empty.bytes, "");
+unique_iconv open_converter(const char *codeset, kx_uint32_t flags) {
+    cu_iconv_t h = nullptr;
+    EXPECT_EQ(cu_iconv_open_1(codeset, flags, &h), CU_ICONV_OK) << codeset;
+    return unique_iconv(h);
 }
 
-TEST(IconvTest, OutputGrowsBeyondItsFirstGuess) {
-    IconvPtr h = open_converter("UTF-32LE", CU_ICONV_FROM_UTF8);
-    std::string expected;
+constexpr kx_uint32_t to = CU_ICONV_TO_UTF8, from = CU_ICONV_FROM_UTF8;
+constexpr kx_uint32_t standard = CU_ICONV_UTF8_STANDARD, bmp = CU_ICONV_UTF8_BMP_ONLY;
+
+struct conversion {
+    const char *codeset;
+    kx_uint32_t flags;
+    std::string in;
+    result out;
+};
+
+std::vector<conversion> conversions() {
+    const std::string grin8 = "\xF0\x9F\x98\x80", grin16("\x3D\xD8\x00\xDE", 4);
+    std::string a32;
     for (int i = 0; i < 5000; ++i)
-        expected += std::string("a\0\0\0", 4);
-    EXPECT_EQ(convert(h.get(), std::string(5000, 'a')).bytes, expected);
-}
-
-TEST(IconvTest, InvalidUtf8IsABadSequence) {
-    const std::string cases[] = {
+        a32 += std::string("a\0\0\0", 4);
+    std::vector<conversion> all = {
+        {"ISO-8859-1", to, "caf\xE9" + nul, {CU_ICONV_OK, "caf\xC3\xA9" + nul}},
+        {"ISO-8859-1", from, "caf\xC3\xA9" + nul, {CU_ICONV_OK, "caf\xE9" + nul}},
+        {"ISO-8859-1", to, "\xE9", {CU_ICONV_OK, "\xC3\xA9"}}, // no terminator in, none out
+        {"ISO-8859-1", to, "", {CU_ICONV_OK, ""}},
+        {"UTF-32LE", from, std::string(5000, 'a'), {CU_ICONV_OK, a32}}, // beyond the first guess
+        {"ISO-8859-1", from, "ab\xE2\x82", {CU_ICONV_INCOMPLETE, ""}},
+        {"ISO-8859-1", from, "price \xE2\x82\xAC" + nul, {CU_ICONV_UNMAPPABLE, ""}},
+        {"UTF-16LE", to, std::string("a\0b", 3), {CU_ICONV_INCOMPLETE, ""}},
+        // C0 80, the modified form of NUL, only where standard UTF-8 is not asked for.
+        {"ISO-8859-1", from | standard, "a\xC0\x80\xC3\xA9" + nul, {CU_ICONV_BAD_SEQUENCE, ""}},
+        {"ISO-8859-1", from, "a\xC0\x80\xC3\xA9" + nul, {CU_ICONV_OK, "a" + nul + "\xE9" + nul}},
+        {"ISO-8859-1", from, "a\xC0\x62", {CU_ICONV_BAD_SEQUENCE, ""}}, // C0 before 'b'
+        // Characters beyond U+FFFF, refused when the BMP is the limit.
+        {"UTF-16LE", from | bmp, "a" + grin8, {CU_ICONV_UNMAPPABLE, ""}},
+        {"UTF-16LE", to | bmp, grin16, {CU_ICONV_UNMAPPABLE, ""}},
+        {"UTF-16LE", from | bmp, "\xEF\xBF\xBD", {CU_ICONV_OK, "\xFD\xFF"}},
+        {"UTF-16LE", to | bmp, "\xAC\x20", {CU_ICONV_OK, "\xE2\x82\xAC"}},
+        {"UTF-16LE", from, grin8, {CU_ICONV_OK, grin16}},
+        {"UTF-16LE", to, grin16, {CU_ICONV_OK, grin8}},
+        // ISO-2022-JP keeps state: a failure mid-text must not leak into the
+        // next text, and each text ends in the initial state.
+        {"ISO-2022-JP", to, "\x1B$BF|\xFF", {CU_ICONV_BAD_SEQUENCE, ""}},
+        {"ISO-2022-JP", to, "AB", {CU_ICONV_OK, "AB"}},
+        {"ISO-2022-JP", from, "\xE6\x97\xA5", {CU_ICONV_OK, "\x1B$BF|\x1B(B"}},
+    };
+    const std::string bad_utf8[] = {
         "\xFF",
         "a\x80",
-        "\xC3\x28",
+        "\xC3\x28",               // no sequence
         "\xC1\xBF",               // overlong DEL
         "\xE0\x80\xAF",           // overlong '/'
         "\xED\xA0\x80",           // surrogate
         "\xF4\x90\x80\x80",       // beyond U+10FFFF
         std::string("\xC3\0", 2), // a sequence cut by the terminator
     };
-    IconvPtr to_latin1 = open_converter("ISO-8859-1", CU_ICONV_FROM_UTF8);
-    IconvPtr utf8_from = open_converter("UTF-8", CU_ICONV_FROM_UTF8);
-    IconvPtr utf8_to = open_converter("UTF-8", CU_ICONV_TO_UTF8);
-    for (const std::string &input : cases) {
-        const std::string shown = ::testing::PrintToString(input);
-        EXPECT_EQ(convert(to_latin1.get(), input).status, CU_ICONV_BAD_SEQUENCE) << shown;
-        EXPECT_EQ(convert(utf8_from.get(), input).status, CU_ICONV_BAD_SEQUENCE) << shown;
-        EXPECT_EQ(convert(utf8_to.get(), input).status, CU_ICONV_BAD_SEQUENCE) << shown;
+    for (const std::string &in : bad_utf8)
+        for (auto [codeset, flags] :
+             {std::pair{"ISO-8859-1", from}, {"UTF-8", from}, {"UTF-8", to}})
+            all.push_back({codeset, flags, in, {CU_ICONV_BAD_SEQUENCE, ""}});
+    return all;
+}
+
+// Each codeset and flags get one handle, which the rows after share.
+TEST(IconvTest, ConvertsExactlyOrFailsWithTheReason) {
+    std::map<std::pair<std::string, kx_uint32_t>, unique_iconv> handles;
+    for (const conversion &c : conversions()) {
+        unique_iconv &h = handles[{c.codeset, c.flags}];
+        if (!h)
+            h = open_converter(c.codeset, c.flags);
+        EXPECT_EQ(convert(h.get(), c.in), c.out)
+            << c.codeset << " " << c.flags << " " << ::testing::PrintToString(c.in);
     }
-}
-
-TEST(IconvTest, IncompleteAndUnmappableInput) {
-    IconvPtr from = open_converter("ISO-8859-1", CU_ICONV_FROM_UTF8);
-    EXPECT_EQ(convert(from.get(), "ab\xE2\x82").status, CU_ICONV_INCOMPLETE);
-    EXPECT_EQ(convert(from.get(), "price \xE2\x82\xAC" + kNul).status, CU_ICONV_UNMAPPABLE);
-    IconvPtr to = open_converter("UTF-16LE", CU_ICONV_TO_UTF8);
-    EXPECT_EQ(convert(to.get(), std::string("a\0b", 3)).status, CU_ICONV_INCOMPLETE);
-}
-
-TEST(IconvTest, EncodedNulIsRefusedOnlyInTheStandardForm) {
-    const std::string text = "a\xC0\x80\xC3\xA9" + kNul;
-    IconvPtr standard = open_converter("ISO-8859-1", CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_STANDARD);
-    EXPECT_EQ(convert(standard.get(), text).status, CU_ICONV_BAD_SEQUENCE);
-    IconvPtr modified = open_converter("ISO-8859-1", CU_ICONV_FROM_UTF8);
-    EXPECT_EQ(convert(modified.get(), text).bytes, "a" + kNul + "\xE9" + kNul);
-    EXPECT_EQ(convert(modified.get(), "a\xC0"
-                                      "b")
-                  .status,
-              CU_ICONV_BAD_SEQUENCE);
-}
-
-TEST(IconvTest, BmpOnlyRefusesCharactersBeyondU_FFFF) {
-    const std::string grin_utf8 = "\xF0\x9F\x98\x80";
-    const std::string grin_utf16("\x3D\xD8\x00\xDE", 4);
-    const kx_uint32_t bmp = CU_ICONV_UTF8_BMP_ONLY;
-    IconvPtr from_limited = open_converter("UTF-16LE", CU_ICONV_FROM_UTF8 | bmp);
-    IconvPtr to_limited = open_converter("UTF-16LE", CU_ICONV_TO_UTF8 | bmp);
-    EXPECT_EQ(convert(from_limited.get(), "a" + grin_utf8).status, CU_ICONV_UNMAPPABLE);
-    EXPECT_EQ(convert(to_limited.get(), grin_utf16).status, CU_ICONV_UNMAPPABLE);
-    EXPECT_EQ(convert(from_limited.get(), "\xEF\xBF\xBD").bytes, "\xFD\xFF"); // U+FFFD
-    EXPECT_EQ(convert(to_limited.get(), std::string("\xAC\x20", 2)).bytes, "\xE2\x82\xAC");
-
-    IconvPtr from_open = open_converter("UTF-16LE", CU_ICONV_FROM_UTF8);
-    IconvPtr to_open = open_converter("UTF-16LE", CU_ICONV_TO_UTF8);
-    EXPECT_EQ(convert(from_open.get(), grin_utf8).bytes, grin_utf16);
-    EXPECT_EQ(convert(to_open.get(), grin_utf16).bytes, grin_utf8);
-}
-
-TEST(IconvTest, EachTextStartsAndEndsInTheInitialShiftState) {
-    // ISO-2022-JP keeps state: a failure mid-text must not leak into the next.
-    IconvPtr h = open_converter("ISO-2022-JP", CU_ICONV_TO_UTF8);
-    EXPECT_EQ(convert(h.get(), "\x1B$BF|\xFF").status, CU_ICONV_BAD_SEQUENCE);
-    EXPECT_EQ(convert(h.get(), "AB").bytes, "AB");
-    IconvPtr back = open_converter("ISO-2022-JP", CU_ICONV_FROM_UTF8);
-    EXPECT_EQ(convert(back.get(), "\xE6\x97\xA5").bytes, "\x1B$BF|\x1B(B");
 }
 
 TEST(IconvTest, BadArgumentsAndUnknownCodesets) {
@@ -139,12 +129,11 @@ TEST(IconvTest, BadArgumentsAndUnknownCodesets) {
     EXPECT_EQ(h, nullptr);
     EXPECT_EQ(cu_iconv_open_1("UTF-8", 0, nullptr), CU_ICONV_BAD_ARGUMENT);
     EXPECT_EQ(cu_iconv_open_1("UTF-8", 0x40, &h), CU_ICONV_BAD_ARGUMENT);
-    EXPECT_EQ(cu_iconv_open_1("ISO-8859-1//IGNORE", CU_ICONV_FROM_UTF8, &h), CU_ICONV_BAD_ARGUMENT);
+    EXPECT_EQ(cu_iconv_open_1("ISO-8859-1//IGNORE", from, &h), CU_ICONV_BAD_ARGUMENT);
 
-    IconvPtr conv = open_converter("ISO-8859-1", CU_ICONV_TO_UTF8);
+    unique_iconv conv = open_converter("ISO-8859-1", to);
     char *out = nullptr;
-    size_t len = 2;
-    size_t out_len = 0;
+    size_t len = 2, out_len = 0;
     EXPECT_EQ(cu_iconv_str_1(nullptr, 0, "a", &len, &out, &out_len), CU_ICONV_BAD_ARGUMENT);
     EXPECT_EQ(cu_iconv_str_1(conv.get(), 1, "a", &len, &out, &out_len), CU_ICONV_BAD_ARGUMENT);
     EXPECT_EQ(cu_iconv_str_1(conv.get(), 0, nullptr, &len, &out, &out_len), CU_ICONV_BAD_ARGUMENT);
@@ -157,7 +146,7 @@ TEST(IconvTest, BadArgumentsAndUnknownCodesets) {
 TEST(IconvTest, OneHandleServesManyThreads) {
     // A stateful codeset with failures mixed in: a text that starts in
     // another text's shift state decodes wrongly.
-    IconvPtr h = open_converter("ISO-2022-JP", CU_ICONV_TO_UTF8);
+    unique_iconv h = open_converter("ISO-2022-JP", to);
     std::string good, want;
     for (int i = 0; i < 64; ++i) {
         good += "x\x1B$BF|F|\x1B(B";
@@ -170,8 +159,8 @@ TEST(IconvTest, OneHandleServesManyThreads) {
         threads.emplace_back([&, t] {
             for (int i = 0; i < 500; ++i) {
                 const bool fail = (i + t) % 2 == 0;
-                const Result r = convert(h.get(), fail ? bad : good + kNul);
-                wrong[t] += fail ? r.status != CU_ICONV_BAD_SEQUENCE : r.bytes != want + kNul;
+                const result r = convert(h.get(), fail ? bad : good + nul);
+                wrong[t] += fail ? r.status != CU_ICONV_BAD_SEQUENCE : r.bytes != want + nul;
             }
         });
     }

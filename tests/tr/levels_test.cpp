@@ -5,7 +5,6 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
-#include <ostream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -37,43 +36,34 @@ class Levels : public ::testing::Test {
     levels_t levels = untouched;
 };
 
-struct configured_case {
-    const char *configured;
-    levels_t expected;
-};
-
-void PrintTo(const configured_case &c, std::ostream *out) {
-    *out << '"' << c.configured << '"';
+// Settings of other components, and settings that cannot be read, leave
+// the levels alone.
+TEST_F(Levels, ConfiguredLevelsAreAppliedAtRegistration) {
+    const struct {
+        const char *configured;
+        levels_t expected;
+    } cases[] = {
+        // clang-format off
+        {"", defaults}, {"_TST:api=8,PERF=6", {0, 8, 6, 9, 4}},
+        {"_SEL:API=8;_TST:Perf=7;_XYZ:*=1", {0, 1, 7, 9, 4}}, {"_TST:*=1,API=8", {1, 8, 2, 1, 4}},
+        {"_TST:API=8,*=1", {1, 1, 2, 1, 4}}, {"_TST:*=0", minimums},
+        {"_TST:ALL=3,api=8", {3, 8, 3, 3, 4}}, {"_TST:*=7", {7, 7, 7, 7, 7}},
+        {"_TST:API=8;;_TST:,Errors=2,", {2, 8, 3, 9, 4}}, {" _TST : API = 8 ", {0, 8, 3, 9, 4}},
+        {"_TST:Unknown=5,API=6,Perf=", {0, 6, 3, 9, 4}}, {"_TST:API=12", {0, 9, 3, 9, 4}},
+        {"_TST:API=4294967296", {0, 9, 3, 9, 4}}, {"_TST:API=", defaults}, {"_TST", defaults},
+        {":::", defaults}, {"API=8", defaults}, {"_TST:API", defaults}, {"_TST:=5", defaults},
+        {"_TST:API=-1", defaults}, {"_TST:API=8x", defaults}, {"_TST:API=8:Perf=2", defaults},
+        {"_tst:API=8", defaults}, {"_TST2:API=8", defaults}, {"_TS:API=8", defaults},
+        // clang-format on
+    };
+    for (const auto &c : cases) {
+        setenv("KX_TRACE_LEVELS", c.configured, 1);
+        levels = untouched;
+        ASSERT_EQ(register_as("_TST", levels), TR_OK) << c.configured;
+        EXPECT_EQ(levels, c.expected) << c.configured;
+        ASSERT_EQ(tr_unregister_component_1("_TST"), TR_OK);
+    }
 }
-
-class ConfiguredLevels : public Levels, public ::testing::WithParamInterface<configured_case> {};
-
-TEST_P(ConfiguredLevels, AreAppliedAtRegistration) {
-    setenv("KX_TRACE_LEVELS", GetParam().configured, 1);
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
-    EXPECT_EQ(levels, GetParam().expected);
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Env, ConfiguredLevels,
-    ::testing::Values(
-        configured_case{"", defaults}, configured_case{"_TST:api=8,PERF=6", {0, 8, 6, 9, 4}},
-        configured_case{"_SEL:API=8;_TST:Perf=7;_XYZ:*=1", {0, 1, 7, 9, 4}},
-        configured_case{"_TST:*=1,API=8", {1, 8, 2, 1, 4}},
-        configured_case{"_TST:API=8,*=1", {1, 1, 2, 1, 4}}, configured_case{"_TST:*=0", minimums},
-        configured_case{"_TST:ALL=3,api=8", {3, 8, 3, 3, 4}},
-        configured_case{"_TST:*=7", {7, 7, 7, 7, 7}},
-        configured_case{"_TST:API=8;;_TST:,Errors=2,", {2, 8, 3, 9, 4}},
-        configured_case{" _TST : API = 8 ", {0, 8, 3, 9, 4}},
-        configured_case{"_TST:Unknown=5,API=6,Perf=", {0, 6, 3, 9, 4}},
-        configured_case{"_TST:API=12", {0, 9, 3, 9, 4}},
-        configured_case{"_TST:API=4294967296", {0, 9, 3, 9, 4}},
-        configured_case{"_TST:API=", defaults}, configured_case{"_TST", defaults},
-        configured_case{":::", defaults}, configured_case{"API=8", defaults},
-        configured_case{"_TST:API", defaults}, configured_case{"_TST:=5", defaults},
-        configured_case{"_TST:API=-1", defaults}, configured_case{"_TST:API=8x", defaults},
-        configured_case{"_TST:API=8:Perf=2", defaults}, configured_case{"_tst:API=8", defaults},
-        configured_case{"_TST2:API=8", defaults}, configured_case{"_TS:API=8", defaults}));
 
 // Generated strings of mostly the syntax's own characters never break
 // registration nor leave a level outside [minimum, 9]; a long one is read
@@ -128,25 +118,25 @@ TEST_F(Levels, SetChangesNamedCategoriesOfItsComponentOnly) {
 
 // Each part that cannot be read is named once on standard error: syntax
 // once per process, a category the component lacks at its registration; a
-// few warnings at most.
+// few warnings at most. Empty parts are no mistake.
 TEST_F(Levels, UnreadablePartsAreWarnedAboutByName) {
-    setenv("KX_TRACE_LEVELS", "_TST:API=8x,Nope=1,all=2;API=8;_TST:Perf", 1);
+    setenv("KX_TRACE_LEVELS", "_TST:API=8x,Nope=1,all=2,,=5;API=8;;_TST:Perf", 1);
     ::testing::internal::CaptureStderr();
     ASSERT_EQ(register_as("_TST", levels), TR_OK);
     EXPECT_EQ(levels, (levels_t{2, 2, 2, 2, 4})) << "only all=2 is read";
     ASSERT_EQ(tr_unregister_component_1("_TST"), TR_OK);
-    setenv("KX_TRACE_LEVELS", "_TST:a=1,b=1,c=1,d=1,e=1,f=1", 1);
+    setenv("KX_TRACE_LEVELS", "_TST:a=1,b=1,c=1,d=1,e=1", 1);
     ASSERT_EQ(register_as("_TST", levels), TR_OK);
     const std::string prefix = "kx_tr: KX_TRACE_LEVELS: ";
     const std::string all = " (Perf, Errors, Info, API, Buffer, or all)\n";
     EXPECT_EQ(::testing::internal::GetCapturedStderr(),
               prefix + "the level of \"API=8x\" is not a number from 0 to 9\n" + prefix +
+                  "\"=5\" names no category\n" + prefix +
                   "\"API=8\" names no component (write COMPONENT:CATEGORY=LEVEL,...)\n" + prefix +
                   "\"Perf\" has no \"=LEVEL\"\n" + prefix + "no category \"Nope\" in _TST" + all +
                   prefix + "no category \"a\" in _TST" + all + prefix +
                   "no category \"b\" in _TST" + all + prefix + "no category \"c\" in _TST" + all +
-                  prefix + "no category \"d\" in _TST" + all + prefix +
-                  "further mistakes not shown\n");
+                  prefix + "further mistakes not shown\n");
 }
 
 // The registry keeps its own copies of the names.

@@ -10,6 +10,7 @@
 #include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <map>
 #include <set>
 #include <string>
 #include <thread>
@@ -26,13 +27,14 @@
 
 #include <kx_tr.h>
 
-#include "tr_test_util.h"
+#include "support.h"
 
 namespace {
 
-using tr_test::hex_of;
-using tr_test::read_lines;
-using tr_test::read_records;
+using kxtest::read_lines;
+using kxtest::read_trace_lines;
+// The item text of some bytes, computed independently of the library.
+using kxtest::trace_item;
 using strings = std::vector<std::string>;
 // A length, typed as the C API reads it from the variadic arguments.
 constexpr kx_uint32_t u32(kx_uint32_t n) {
@@ -42,8 +44,7 @@ constexpr kx_uint32_t u32(kx_uint32_t n) {
 class Records : public ::testing::Test {
   protected:
     void SetUp() override { setenv("KX_TRACE_FILE", trace.c_str(), 1); }
-    tr_test::scratch_dir dir;
-    std::string trace = dir.file("trace.out");
+    std::string trace = kxtest::temp_dir() + "/trace.out";
 };
 
 long long nanoseconds_of(long long seconds, long long nanoseconds) {
@@ -61,11 +62,10 @@ TEST_F(Records, LinesCarryTimeThreadComponentIdAndHexItems) {
               TR_OK);
     clock_gettime(CLOCK_REALTIME, &after);
 
-    const auto lines = read_lines(trace);
-    ASSERT_EQ(lines.size(), 2u);
-    EXPECT_TRUE(lines[0].ends_with(" _TST 42")) << lines[0];
-    const auto r = read_records(trace);
+    const auto r = read_trace_lines(trace);
     ASSERT_EQ(r.size(), 2u);
+    EXPECT_EQ(r[0].component, "_TST");
+    EXPECT_EQ(r[0].id, 42u);
     EXPECT_GE(nanoseconds_of(r[0].seconds, r[0].nanoseconds),
               nanoseconds_of(before.tv_sec, before.tv_nsec));
     EXPECT_LE(nanoseconds_of(r[1].seconds, r[1].nanoseconds),
@@ -104,13 +104,14 @@ TEST_F(Records, ItemsOfAnySizeAndCountAreWrittenWhole) {
               TR_BAD_ARGUMENT);
     EXPECT_EQ(tr_record_data_1("_TST", 1, UINT32_MAX), TR_BAD_ARGUMENT); // reads no argument
 
-    const auto r = read_records(trace);
+    const auto r = read_trace_lines(trace);
     ASSERT_EQ(r.size(), lengths.size() + 1);
     for (std::size_t i = 0; i < lengths.size(); ++i)
-        EXPECT_EQ(r[i].items, (strings{hex_of(bytes.data(), lengths[i]), "7a00"})) << lengths[i];
+        EXPECT_EQ(r[i].items, (strings{trace_item(bytes.data(), lengths[i]), "7a00"}))
+            << lengths[i];
     ASSERT_EQ(r.back().items.size(), 64u);
     for (std::size_t i = 0; i < 64; ++i)
-        EXPECT_EQ(r.back().items[i], hex_of(&bytes[16 * i], 16)) << i;
+        EXPECT_EQ(r.back().items[i], trace_item(&bytes[16 * i], 16)) << i;
 }
 
 // Records append to what the file holds; refused ones write nothing, and
@@ -166,40 +167,35 @@ TEST_F(Records, ConcurrentRecordsStayWholeLines) {
         w.join();
     EXPECT_EQ(failures, 0);
 
-    ASSERT_EQ(read_lines(trace).size(), threads * per_thread);
-    const auto records = read_records(trace);
+    std::map<std::string, kx_uint32_t> seq_of; // by its item
+    for (kx_uint32_t seq = 0; seq < per_thread; ++seq)
+        seq_of[trace_item(&seq, 4)] = seq;
+    const auto records = read_trace_lines(trace);
     ASSERT_EQ(records.size(), threads * per_thread);
     std::set<std::pair<kx_uint32_t, kx_uint32_t>> seen;
     for (const auto &r : records) {
         ASSERT_LT(r.id, threads);
         ASSERT_EQ(r.items.size(), 2u);
         const auto t = static_cast<kx_uint32_t>(r.id);
-        ASSERT_EQ(r.items[0].size(), 8u);
-        unsigned char seq_bytes[4];
-        for (int i = 0; i < 4; ++i)
-            seq_bytes[i] =
-                static_cast<unsigned char>(std::stoul(r.items[0].substr(2 * i, 2), nullptr, 16));
-        kx_uint32_t seq;
-        std::memcpy(&seq, seq_bytes, sizeof seq);
-        ASSERT_LT(seq, per_thread);
+        const auto found = seq_of.find(r.items[0]);
+        ASSERT_NE(found, seq_of.end()) << r.items[0];
+        const kx_uint32_t seq = found->second;
         const auto p = payload_of(t, seq);
-        EXPECT_EQ(r.items[1], hex_of(p.data(), p.size()));
+        EXPECT_EQ(r.items[1], trace_item(p.data(), p.size()));
         EXPECT_EQ(r.thread, thread_ids[t]);
         EXPECT_TRUE(seen.insert({t, seq}).second) << "twice: " << t << "/" << seq;
     }
 }
 
-// --- without a usable trace file ---------------------------------------------
-
 // Records succeed and leave no file, not even in the working directory.
 void expect_records_dropped() {
-    tr_test::scratch_dir dir;
+    const std::string dir = kxtest::temp_dir();
     const auto saved = std::filesystem::current_path();
-    std::filesystem::current_path(dir.path);
+    std::filesystem::current_path(dir);
     EXPECT_EQ(tr_record_id_1("_TST", 1), TR_OK);
     EXPECT_EQ(tr_record_data_1("_TST", 2, 1, "x", u32(1)), TR_OK);
     std::filesystem::current_path(saved);
-    EXPECT_TRUE(std::filesystem::is_empty(dir.path));
+    EXPECT_TRUE(std::filesystem::is_empty(dir));
 }
 
 TEST(Unrecorded, WithoutTraceFileRecordsAreDropped) {
@@ -213,8 +209,7 @@ TEST(Unrecorded, EmptyTraceFileNameMeansNoFile) {
 }
 
 TEST(Unrecorded, UnopenableFileFailsEveryRecordAndKeepsErrno) {
-    tr_test::scratch_dir dir;
-    setenv("KX_TRACE_FILE", dir.file("missing/trace.out").c_str(), 1);
+    setenv("KX_TRACE_FILE", (kxtest::temp_dir() + "/missing/trace.out").c_str(), 1);
     errno = 4242;
     EXPECT_EQ(tr_record_id_1("_TST", 1), TR_WRITE_FAILED);
     EXPECT_EQ(tr_record_data_1("_TST", 2, 1, "x", u32(1)), TR_WRITE_FAILED);
@@ -233,9 +228,9 @@ TEST(Unrecorded, FailedWriteIsReportedAndKeepsErrno) {
 // Opening a FIFO for writing waits for a reader; a trace point must not. The
 // record runs in a child, so that a hang fails the test, not the whole run.
 TEST(Unrecorded, FifoWithoutReaderDoesNotHang) {
-    tr_test::scratch_dir dir;
-    ASSERT_EQ(mkfifo(dir.file("fifo").c_str(), 0600), 0);
-    setenv("KX_TRACE_FILE", dir.file("fifo").c_str(), 1);
+    const std::string fifo = kxtest::temp_dir() + "/fifo";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    setenv("KX_TRACE_FILE", fifo.c_str(), 1);
     const pid_t child = fork();
     ASSERT_GE(child, 0);
     if (child == 0)
