@@ -6,8 +6,8 @@
 #define KXACL_ALLOC_H
 
 #include <cstddef>
-#include <cstdlib>
-#include <memory>
+
+#include "unique_mem.h"
 
 namespace kxacl {
 
@@ -17,11 +17,8 @@ void *mem_realloc(void *p, std::size_t size);
 // A copy of the length bytes at s followed by a NUL.
 char *mem_strndup(const char *s, std::size_t length);
 
-struct free_deleter {
-    void operator()(void *p) const noexcept { std::free(p); }
-};
 // Memory from the malloc family, freed on every path unless released.
-template <typename T> using unique_mem = std::unique_ptr<T, free_deleter>;
+using kx::unique_mem;
 
 // Fault injection for tests: after `successes` more allocations succeed, every
 // following one fails until the hook is reset with a negative value.

@@ -6,7 +6,7 @@
 
 #include "alloc.h"
 #include "byteorder.h"
-#include "cu/posix_case.h"
+#include "posix_case.h"
 #include "entries.h"
 #include "report.h"
 

@@ -16,7 +16,7 @@
 #include "alloc.h"
 #include "buffer_format.h"
 #include "byteorder.h"
-#include "cu/posix_case.h"
+#include "posix_case.h"
 #include "entries.h"
 #include "frame.h"
 #include "report.h"

@@ -5,7 +5,7 @@
 #include <cstring>
 
 #include "alloc.h"
-#include "cu/posix_case.h"
+#include "posix_case.h"
 #include "entries.h"
 #include "frame.h"
 #include "report.h"

@@ -33,7 +33,7 @@ namespace kxacl {
 // keeps its place with a null entry.
 struct sec_acltree_node_s {
     sec_acle_t sat_acle;       // &sat_entry, or null
-    std::uint64_t sat_key;     // the identifier's sort key (cu/posix_case.h)
+    std::uint64_t sat_key;     // the identifier's sort key (posix_case.h)
     std::uint32_t sat_id_size; // the identifier's length with its NUL; 0 without one
     std::uint32_t sat_hash;    // of the folded identifier, for the index
     sec_acle_desc sat_entry;   // its identifier lies in a text block of the tree

@@ -8,6 +8,8 @@
 
 #include <kx_cu.h>
 
+#include "unique_mem.h"
+
 namespace kxtool {
 namespace {
 
@@ -16,12 +18,6 @@ constexpr std::array<type_names, 5> types = {{{SEC_ACLE_UNAUTHENTICATED, 'n', "u
                                               {SEC_ACLE_USER, 'u', "user"},
                                               {SEC_ACLE_EXPANDED, 'e', "expanded"},
                                               {SEC_ACLE_GROUP, 'g', "group"}}};
-
-// A text that the library allocated, released with free.
-struct owned_text {
-    char *p = nullptr;
-    ~owned_text() { std::free(p); }
-};
 
 // An entry list that the library filled, released on destruction.
 struct entry_list {
@@ -85,10 +81,13 @@ void write_grant(json_writer &json, std::uint32_t mask, template_set &templates)
 
 shown_entry show(const sec_acle_desc &acle, template_set &templates) {
     shown_entry e{&names_of(acle.type), {}, {}, acle.mech, acle.id ? acle.id : "", {}, acle.perm};
-    owned_text mech, id;
-    if (sec_display_acle_id(const_cast<sec_acle_t>(&acle), &mech.p, &id.p) == SEC_S_OK) {
-        e.mech = mech.p ? mech.p : "";
-        e.id = id.p ? id.p : "";
+    char *mech_text = nullptr, *id_text = nullptr;
+    const bool displayed =
+        sec_display_acle_id(const_cast<sec_acle_t>(&acle), &mech_text, &id_text) == SEC_S_OK;
+    const kx::unique_mem<char> mech(mech_text), id(id_text);
+    if (displayed) {
+        e.mech = mech ? mech.get() : "";
+        e.id = id ? id.get() : "";
     } else {
         cu_set_no_error_1();
         e.mech = e.raw_mech;
