@@ -213,11 +213,14 @@ bool strictly_ascending(acl_bytes b, const subacl_view &v) {
     std::size_t previous_size = 0;
     bool ascending = true;
     kx_int32_t rc = walk_acles(b, v, [&](const acle_record &e) {
-        ascending = e.id_terminated() &&
-                    (!previous ||
-                     kx::posix_case::compare(previous, previous_size, e.id, id_size_of(e)) < 0);
+        if (!e.id_terminated()) {
+            ascending = false;
+            return walk_stop;
+        }
+        const std::size_t size = id_size_of(e);
+        ascending = !previous || kx::posix_case::compare(previous, previous_size, e.id, size) < 0;
         previous = e.id;
-        previous_size = ascending ? id_size_of(e) : 0;
+        previous_size = size;
         return ascending ? SEC_S_OK : walk_stop;
     });
     // A record past the end is left for the tree's walk to report.
