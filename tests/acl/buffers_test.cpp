@@ -226,14 +226,15 @@ TEST(ListAcl, ReleaseEmptiesTheListOnce) {
     sec_release_aclelist(nullptr);
 }
 
-// Every allocation of a listing fails in turn: the list ends empty. Two
-// group entries in order take the list and one block per entry; the other
-// listings build trees as well.
+// Every allocation of a listing fails in turn: the list ends empty. User and
+// group entries in ascending order take the list and one block per entry,
+// with no tree; the other sub-ACLs build trees as well. The counts are exact,
+// so that a listing that builds a tree it does not need is noticed.
 TEST(AllocationFailure, ListAclAndListAclByType) {
     bytes rich = rich_acl();
     for (auto [type, allocations] :
-         {std::pair<unsigned char, long>{0, 10}, {SEC_ACLE_USER, 6}, {SEC_ACLE_GROUP, 3}}) {
-        EXPECT_GE(for_each_allocation_failure([&](long n) {
+         {std::pair<unsigned char, long>{0, 25}, {SEC_ACLE_USER, 6}, {SEC_ACLE_GROUP, 3}}) {
+        EXPECT_EQ(for_each_allocation_failure([&](long n) {
                       owned_acl acl(rich);
                       owned_list list;
                       kx_int32_t rc = failing_after(n, [&] {
