@@ -197,9 +197,17 @@ struct acle_record {
     bool id_well_formed() const;
     // The identifier holds a NUL within its bytes, so it can be read as a text.
     bool id_terminated() const;
-    // The identifier ends in its NUL: checking that one byte keeps a walk to
-    // a single pass over the identifier, the comparison's own.
-    bool id_ends_in_nul() const { return id_length != 0 && id[id_length - 1] == '\0'; }
+};
+
+// What a walk of records demands of each identifier field besides lying
+// within the walk's bytes.
+enum class id_rule {
+    as_stored,
+    // Ends in its NUL, so that it can be read as a text: no writer makes
+    // another (validation refuses it with 2650-127), and checking that one
+    // byte keeps a walk to a single pass over the identifier, the
+    // comparison's own. Evaluation walks so.
+    ends_in_nul,
 };
 
 // Calls visit(record) for the records of sub-ACL v in stored order, within
@@ -209,7 +217,7 @@ struct acle_record {
 // walks of evaluation, on the path of every request, step through it by
 // pointer, every record's place depending on the length read from the one
 // before.
-template <typename Visit, typename Prepare = no_prepare>
+template <id_rule Ids = id_rule::as_stored, typename Visit, typename Prepare = no_prepare>
 kx_int32_t walk_acles(acl_bytes records, const subacl_view &v, Visit visit,
                       std::size_t *end = nullptr, Prepare prepare = {}) {
     const unsigned char *const limit = records.data + records.size;
@@ -223,7 +231,8 @@ kx_int32_t walk_acles(acl_bytes records, const subacl_view &v, Visit visit,
         const std::size_t id_length = load_u16(at + layout::at_id_length);
         const unsigned char *id = at + layout::at_id;
         const auto readable = static_cast<std::size_t>(limit - id);
-        if (id_length > readable)
+        if (id_length > readable ||
+            (Ids == id_rule::ends_in_nul && (id_length == 0 || id[id_length - 1] != '\0')))
             return report_corrupt(here(src_acl));
         kx_int32_t rc =
             visit(acle_record{at, id_length, reinterpret_cast<const char *>(id), readable});

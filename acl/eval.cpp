@@ -129,16 +129,11 @@ kx_int32_t no_entry(unsigned char type, const char *mech, const char *id) {
 }
 
 // Calls visit(entry) for the entries of sub-ACL v in stored order until it
-// returns anything but SEC_S_OK. An identifier that does not end in its NUL
-// ends the walk with 2650-110 instead of being read as a text: no writer
-// makes one (validation refuses it with 2650-127), and checking that one
-// byte keeps the walk to a single pass over each identifier, the
-// comparison's own. Records may be read to the buffer's end, which lets
-// comparisons read eight bytes at a time.
+// returns anything but SEC_S_OK. Records may be read to the buffer's end,
+// which lets comparisons read eight bytes at a time; an identifier that does
+// not end in its NUL ends the walk with 2650-110.
 template <typename Visit> kx_int32_t walk_entries(acl_bytes b, const subacl_view &v, Visit visit) {
-    return walk_acles(b, v, [&](const acle_record &e) {
-        return e.id_ends_in_nul() ? visit(e) : report_corrupt(here(src_acl));
-    });
+    return walk_acles<id_rule::ends_in_nul>(b, v, visit);
 }
 
 // The requester's identity or group name, prepared for comparison with

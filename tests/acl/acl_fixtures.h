@@ -82,10 +82,19 @@ inline bytes make_subacl(unsigned char type, std::uint32_t count, const bytes &m
     return s;
 }
 
+// Sized whole before the sub-ACLs are copied in, as the pieces above are.
 inline bytes make_acl(std::initializer_list<bytes> subacls) {
-    bytes b{0x85, 1, 2, static_cast<unsigned char>(subacls.size()), 0};
+    std::size_t size = 5;
     for (const bytes &s : subacls)
-        b.insert(b.end(), s.begin(), s.end());
+        size += s.size();
+    bytes b(size);
+    b[0] = 0x85;
+    b[1] = 1;
+    b[2] = 2;
+    b[3] = static_cast<unsigned char>(subacls.size());
+    auto at = b.begin() + 5;
+    for (const bytes &s : subacls)
+        at = std::copy(s.begin(), s.end(), at);
     return b;
 }
 
