@@ -158,7 +158,7 @@ bool reserve_component() noexcept {
     if (registry.count < registry.capacity)
         return true;
     const std::size_t capacity = registry.capacity == 0 ? 8 : 2 * registry.capacity;
-    void *grown = std::realloc(registry.items, capacity * sizeof *registry.items);
+    void *grown = std::realloc(registry.items, capacity * sizeof(component *));
     if (!grown)
         return false;
     registry.items = static_cast<component **>(grown);
