@@ -158,7 +158,10 @@ bool reserve_component() noexcept {
     if (registry.count < registry.capacity)
         return true;
     const std::size_t capacity = registry.capacity == 0 ? 8 : 2 * registry.capacity;
-    void *grown = std::realloc(registry.items, capacity * sizeof(component *));
+    // An array of pointers to components, each of which is a block of its own.
+    void *grown =
+        std::realloc(registry.items,
+                     capacity * sizeof(component *)); // NOLINT(bugprone-sizeof-expression)
     if (!grown)
         return false;
     registry.items = static_cast<component **>(grown);
