@@ -641,33 +641,6 @@ TEST(FileTrace, InfoPoints) {
     EXPECT_EQ(records[8].items[0], hex_text(foreign.acl));
     EXPECT_EQ(records[8].items[5], u32(S_IFREG | 0644));
     EXPECT_EQ(records[8].items[6], u32(S_IFREG | 0600));
-
-    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Info", 8), TR_OK);
-    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
-    std::vector<std::vector<std::string>> lines;
-    for (const trace_record &r : read_trace(trace))
-        if (r.id == 114)
-            lines.push_back(r.items);
-    auto line = [](int n, int type, const char *id, kx_uint32_t perm) {
-        return std::vector<std::string>{i32(n), i32(type), txt(""), txt(id), u32(perm)};
-    };
-    EXPECT_EQ(lines, (std::vector<std::vector<std::string>>{line(1, 2, "", 1), line(2, 0, "", 0),
-                                                            line(3, 16, "staff", 3)}));
-}
-
-// Perf 1 times the compile's steps; Perf 2 the opening and reading alone.
-TEST(FileTrace, PerfPointsOfACompile) {
-    std::string trace = start_tracing("_SEL:Perf=1");
-    acl_dir d;
-    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
-    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Perf", 2), TR_OK);
-    ASSERT_EQ(acl_read(d.acl, TEXT).status, SEC_S_OK);
-    auto records = read_trace(trace);
-    ASSERT_EQ(ids_of(records), (std::vector<unsigned>{0, 1, 2, 3, 4, 6}));
-    EXPECT_EQ(records[1].items.size(), 4u);
-    EXPECT_EQ(records[2].items.size(), 4u);
-    ASSERT_EQ(records[3].items.size(), 5u);
-    EXPECT_EQ(records[3].items[1], i32(4));
 }
 
 } // namespace
