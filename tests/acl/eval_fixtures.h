@@ -1,9 +1,11 @@
 // Helpers of the evaluation tests, on top of the shared ACL buffer fixtures:
-// shorthand for identified entry records, the ACL of the evaluation
-// examples, and group lists as the evaluation takes them.
+// identified entry records, the ACL of the evaluation examples, group lists,
+// the two evaluation calls as values, and identity handlers.
 #ifndef KXACL_TEST_EVAL_FIXTURES_H
 #define KXACL_TEST_EVAL_FIXTURES_H
 
+#include <atomic>
+#include <cstring>
 #include <vector>
 
 #include <kx_acl.h>
@@ -19,12 +21,8 @@ using kxtest::make_subacl;
 using kxtest::owned_acl;
 using kxtest::text_field;
 
-// An entry record with an identity; an anyother or unauthenticated one.
-inline bytes rec(kx_uint32_t perm, const char *id) {
-    return make_record(perm, text_field(id));
-}
-inline bytes rec(kx_uint32_t perm) {
-    return make_record(perm);
+inline bytes rec(kx_uint32_t perm, const char *id = nullptr) {
+    return id ? make_record(perm, text_field(id)) : make_record(perm);
 }
 
 // User entries of "unix" (alice 0x3, bob 0x1), group entries (admin 0x4,
@@ -36,10 +34,15 @@ inline bytes example_acl() {
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
 }
 
-// The first length bytes of b: a buffer cut short. owned_acl holds it in a
-// block of exactly that size (none at all for length 0, the empty ACL).
-inline bytes prefix(const bytes &b, std::size_t length) {
-    return bytes(b.begin(), b.begin() + static_cast<std::ptrdiff_t>(length));
+// Entries of every kind that needs no handler or has one of "unix" or "krb5".
+inline bytes rich_acl() {
+    return make_acl(
+        {make_subacl(SEC_ACLE_USER, 4, text_field("unix"),
+                     {rec(0x1, "alice"), rec(0x2, "bob"), rec(0x4, "carol"), rec(0x8, "dave")}),
+         make_subacl(SEC_ACLE_EXPANDED, 3, text_field("krb5"),
+                     {rec(0x10, "zed"), rec(0x20, "pat"), rec(0x40, "*")}),
+         make_subacl(SEC_ACLE_GROUP, 2, {}, {rec(0x100, "admin"), rec(0x200, "staff")}),
+         make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x80)})});
 }
 
 class group_list {
@@ -54,6 +57,48 @@ class group_list {
   private:
     std::vector<sec_buffer_s> groups_;
 };
+
+constexpr kx_uint32_t untouched = 0xdeadbeef;
+
+// The outcome of one evaluation; perm starts as `untouched`.
+struct result {
+    kx_int32_t status;
+    kx_uint32_t perm;
+};
+
+inline result single(sec_acl_buffer_t acl, unsigned char type, const char *mech, const char *zmech,
+                     const char *id) {
+    result r{0, untouched};
+    r.status = sec__single_acle_perm(acl, type, const_cast<char *>(mech), const_cast<char *>(zmech),
+                                     const_cast<char *>(id), &r.perm);
+    return r;
+}
+
+inline result groups_of(sec_acl_buffer_t acl, group_list &groups) {
+    result r{0, untouched};
+    r.status = sec__group_acles_perm(acl, groups.count(), groups.get(), &r.perm);
+    return r;
+}
+
+inline std::atomic<int> handler_calls{0};
+
+// Accepts "u:<name>" for the entry <name>, ordering like the plain comparison.
+inline kx_int32_t prefixed_user(char *id, char *acle_id) {
+    ++handler_calls;
+    if (std::strncmp(id, "u:", 2) != 0)
+        return -1;
+    return cu_strcasecmp_posix_1(id + 2, acle_id);
+}
+
+// Matches "*" and the identity itself; on a mismatch it leaves a record,
+// which evaluation must clear.
+inline kx_int32_t wildcard_with_record(char *id, char *acle_id) {
+    ++handler_calls;
+    if (std::strcmp(acle_id, "*") == 0 || std::strcmp(id, acle_id) == 0)
+        return 0;
+    cu_set_error_1(99, nullptr, "other.cat", 1, 7, "mismatch");
+    return std::strcmp(id, acle_id) < 0 ? -1 : 1;
+}
 
 } // namespace evaltest
 

@@ -1,19 +1,19 @@
-// Permission evaluation and the identity handler registry: one table of
-// requests with their answers and records, the walk against the text
-// comparison, the handler rules, buffers cut or counted past their end, and
-// the Perf points. Argument refusals and the API points are in the tables
-// of api_table_test.
+// Permission evaluation and the identity handler registry: tables of
+// requests with their answers and records, with and without handlers, the
+// walk against the text comparison, buffers cut or counted past their end,
+// and the Perf points. Argument refusals and the API points are in the
+// tables of api_table_test.
 #include <algorithm>
-#include <atomic>
-#include <cstring>
-#include <functional>
+#include <optional>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include <kx_acl.h>
+#include <kx_tr.h>
 
 #include "alloc.h"
 #include "eval.h"
@@ -23,31 +23,35 @@
 
 using namespace kxacl;
 using namespace evaltest;
-using kxtest::arg;
 using kxtest::record_is;
 
 namespace {
 
-constexpr kx_uint32_t untouched = 0xdeadbeef;
-
-// The outcome of one evaluation; perm starts as `untouched`.
-struct result {
+// One request: a group request (type 16) asks for groups, any other one
+// entry. A refusal's mask is 0. No entry is 2650-147 with the type, the
+// mechanism and the identity shown; a damaged sub-ACL is 2650-110 (2650-122
+// for an anyother sub-ACL of several entries) with a source position.
+struct request {
+    bytes acl;
+    unsigned char type;
+    const char *mech, *zmech, *id;
+    std::vector<const char *> groups;
     kx_int32_t status;
     kx_uint32_t perm;
+    const char *shown = nullptr;          // the identity in 2650-147
+    int msg = MSG_2650_110;               // of a damaged sub-ACL
+    std::optional<kx_int32_t> count = {}; // of groups, when not the list's
 };
 
-result single(sec_acl_buffer_t acl, unsigned char type, const char *mech, const char *zmech,
-              const char *id) {
-    result r{0, untouched};
-    r.status = sec__single_acle_perm(acl, type, const_cast<char *>(mech), const_cast<char *>(zmech),
-                                     const_cast<char *>(id), &r.perm);
-    return r;
-}
+constexpr int ok = SEC_S_OK, no = SEC_S_BAD_ACLE, bad = SEC_S_BAD_ACL;
 
-result groups_of(sec_acl_buffer_t acl, std::vector<const char *> names) {
-    group_list list(std::move(names));
+result ask(sec_acl_buffer_t acl, const request &q) {
+    if (q.type != SEC_ACLE_GROUP)
+        return single(acl, q.type, q.mech, q.zmech, q.id);
+    group_list groups(q.groups);
     result r{0, untouched};
-    r.status = sec__group_acles_perm(acl, list.count(), list.get(), &r.perm);
+    r.status = sec__group_acles_perm(acl, q.count.value_or(groups.count()),
+                                     q.groups.empty() ? nullptr : groups.get(), &r.perm);
     return r;
 }
 
@@ -61,45 +65,26 @@ testing::AssertionResult record_at_source(kx_int32_t status, int m) {
            << "record " << e.id << ", message " << e.msg_num << ": " << e.text;
 }
 
-// Granted perm, leaving no record.
-void expect_ok(result r, kx_uint32_t perm) {
-    EXPECT_EQ(r.status, SEC_S_OK);
-    EXPECT_EQ(r.perm, perm);
-    EXPECT_EQ(kxtest::last_error().id, 0);
-}
-
-// No entry for the request: mask 0 and 2650-147 with these arguments.
-void expect_no_entry(result r, long long type, std::string mech, std::string id) {
-    EXPECT_EQ(r.status, SEC_S_BAD_ACLE);
-    EXPECT_EQ(r.perm, 0u);
-    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_147, {type, std::move(mech), std::move(id)}));
+void expect_answer(const request &q, result r) {
+    EXPECT_EQ(r.status, q.status);
+    EXPECT_EQ(r.perm, q.perm);
+    if (q.status == SEC_S_OK)
+        EXPECT_EQ(kxtest::last_error().id, 0);
+    else if (q.status == SEC_S_BAD_ACL)
+        EXPECT_TRUE(record_at_source(q.status, q.msg));
+    else
+        EXPECT_TRUE(record_is(
+            q.status, MSG_2650_147,
+            {q.type, q.type == SEC_ACLE_GROUP || !q.mech ? "" : q.mech, q.shown ? q.shown : ""}));
 }
 
 // ---- requests and their answers --------------------------------------------
 
-bytes walk_acl() {
-    return make_acl(
+std::vector<request> requests() {
+    const bytes ex = example_acl();
+    const bytes walk = make_acl(
         {make_subacl(SEC_ACLE_USER, 4, text_field("unix"),
                      {rec(0x1, "alice"), rec(0x2, "bob"), rec(0x4, "carol"), rec(0x8, "dave")})});
-}
-
-// One request: a group request (type 16) asks for groups, any other one
-// entry. A refusal's mask is 0. No entry is 2650-147 with the type, the
-// mechanism and the identity shown; a damaged sub-ACL is 2650-110 (2650-122
-// for an anyother sub-ACL of several entries) with a source position.
-struct request {
-    bytes acl;
-    unsigned char type;
-    const char *mech, *zmech, *id;
-    std::vector<const char *> groups;
-    kx_int32_t status;
-    kx_uint32_t perm;
-    const char *shown = nullptr; // the identity in 2650-147
-    int msg = MSG_2650_110;      // of a damaged sub-ACL
-};
-
-std::vector<request> requests() {
-    const bytes ex = example_acl(), walk = walk_acl();
     const bytes two_users =
         make_acl({make_subacl(SEC_ACLE_USER, 1, text_field("unix"), {rec(0x1, "carol")}),
                   make_subacl(SEC_ACLE_USER, 1, text_field("vgn2"), {rec(0x2, "carol")})});
@@ -116,11 +101,11 @@ std::vector<request> requests() {
     id_past_end[id_past_end.size() - 8] = 7; // the last identity runs one byte past
     unterminated.back() = 'x';               // the last identity has no NUL
     header_counts_more[3] = 2;               // a sub-ACL that is not there
-    const bytes one_other = make_acl({make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
+    bytes one_other = make_acl({make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
+    one_other.pop_back();
     bytes too_short = make_acl({make_subacl(2, 0, {}, {})}); // leads on to no other
     store_u32(&too_short[5], 0);
     store_u16(&too_short[3], 0xffff);
-    const int ok = SEC_S_OK, no = SEC_S_BAD_ACLE, bad = SEC_S_BAD_ACL;
 
     // clang-format off
     std::vector<request> rows = {
@@ -159,6 +144,9 @@ std::vector<request> requests() {
         {ex, 16, {}, {}, {}, {nullptr, "admin", nullptr}, ok, 0x4},
         {ex, 16, {}, {}, {}, {"zzz", "aaa", "bob"}, no, 0}, {ex, 16, {}, {}, {}, {nullptr}, no, 0},
         {users_named_staff, 16, {}, {}, {}, {"staff"}, no, 0},
+        // A count below zero asks for no group; a count of zero grants nothing
+        // and fails nothing, even without sub-ACLs or a list.
+        {ex, 16, {}, {}, {}, {"staff"}, no, 0, {}, 0, -2}, {make_acl({}), 16, {}, {}, {}, {}, ok, 0},
         // Counts and lengths past the end: what lies before them is still found.
         {counted_on, 16, {}, {}, {}, {"staff"}, ok, 0x2},
         {counted_on, 16, {}, {}, {}, {"zoe"}, bad, 0},
@@ -166,7 +154,7 @@ std::vector<request> requests() {
         {id_past_end, 16, {}, {}, {}, {"staff"}, bad, 0},
         {unterminated, 16, {}, {}, {}, {"staffx"}, bad, 0},
         {header_counts_more, 2, {}, {}, {}, {}, bad, 0},
-        {prefix(one_other, one_other.size() - 1), 2, {}, {}, {}, {}, bad, 0},
+        {one_other, 2, {}, {}, {}, {}, bad, 0},
         {too_short, 1, {}, {}, {}, {}, bad, 0},
     };
     // clang-format on
@@ -181,35 +169,8 @@ TEST(Evaluation, Requests) {
         SCOPED_TRACE(testing::Message() << "type " << int(q.type) << " " << (q.id ? q.id : "-")
                                         << " in " << kxtest::hex_of(q.acl.data(), q.acl.size()));
         owned_acl acl(q.acl);
-        bool group = q.type == SEC_ACLE_GROUP;
-        result r = group ? groups_of(acl.get(), q.groups)
-                         : single(acl.get(), q.type, q.mech, q.zmech, q.id);
-        EXPECT_EQ(r.status, q.status);
-        EXPECT_EQ(r.perm, q.perm);
-        if (q.status == SEC_S_OK)
-            EXPECT_EQ(kxtest::last_error().id, 0);
-        else if (q.status == SEC_S_BAD_ACL)
-            EXPECT_TRUE(record_at_source(q.status, q.msg));
-        else
-            EXPECT_TRUE(
-                record_is(q.status, MSG_2650_147,
-                          {q.type, group || !q.mech ? "" : q.mech, q.shown ? q.shown : ""}));
+        expect_answer(q, ask(acl.get(), q));
     }
-}
-
-// A count below zero asks for no group and finds none; a count of zero is
-// mask 0 and no failure, even without sub-ACLs.
-TEST(Evaluation, GroupCounts) {
-    owned_acl acl(example_acl()), empty(make_acl({}));
-    group_list staff({"staff"});
-    kx_uint32_t perm = untouched;
-    EXPECT_EQ(sec__group_acles_perm(acl.get(), -2, staff.get(), &perm), SEC_S_BAD_ACLE);
-    EXPECT_EQ(perm, 0u);
-    EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_147, {16, "", ""}));
-    perm = untouched;
-    EXPECT_EQ(sec__group_acles_perm(empty.get(), 0, nullptr, &perm), SEC_S_OK);
-    EXPECT_EQ(perm, 0u);
-    EXPECT_EQ(kxtest::last_error().id, 0);
 }
 
 // Walks with eight-byte comparisons give what a walk with
@@ -305,119 +266,30 @@ TEST(Registry, FirstRegistrationOfTypeAndMechanismWins) {
 
 TEST(Registry, AllocationFailureLeavesTheRegistryAsItWas) {
     long long row = sizeof(acl__id_handler_s);
-    mem_fail_after(0);
-    EXPECT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler_a), SEC_S_NO_MEMORY);
-    mem_fail_after(-1);
-    EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"acl__register_id_handler", row}));
-    EXPECT_EQ(lookup(SEC_ID_HANDLER_USER, "unix"), nullptr);
-
-    EXPECT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler_a), SEC_S_OK);
-    mem_fail_after(0);
-    EXPECT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", handler_b),
-              SEC_S_NO_MEMORY);
-    mem_fail_after(-1);
-    EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"acl__register_id_handler", 2 * row}));
-    EXPECT_EQ(lookup(SEC_ID_HANDLER_USER, "unix"), handler_a);
-    EXPECT_EQ(lookup(SEC_ID_HANDLER_EXPANDED, "krb5"), nullptr);
+    for (long long rows : {1, 2}) { // into an empty registry, then one of one row
+        mem_fail_after(0);
+        EXPECT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", handler_b),
+                  SEC_S_NO_MEMORY);
+        mem_fail_after(-1);
+        EXPECT_TRUE(
+            record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"acl__register_id_handler", rows * row}));
+        EXPECT_EQ(lookup(SEC_ID_HANDLER_EXPANDED, "krb5"), nullptr);
+        EXPECT_EQ(lookup(SEC_ID_HANDLER_USER, "unix"), rows == 1 ? nullptr : handler_a);
+        EXPECT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", handler_a), SEC_S_OK);
+    }
 }
 
 // ---- evaluation through handlers -------------------------------------------
 
-std::atomic<int> calls{0};
-
-// Accepts "u:<name>" for the entry <name>, ordering like the plain comparison.
-kx_int32_t prefixed_user(char *id, char *acle_id) {
-    ++calls;
-    if (std::strncmp(id, "u:", 2) != 0)
-        return -1;
-    return cu_strcasecmp_posix_1(id + 2, acle_id);
-}
-
 // Matches only "bob", and says every other entry sorts after the requester.
 kx_int32_t says_before_unless_bob(char *id, char *acle_id) {
-    ++calls;
+    ++handler_calls;
     return std::strcmp(id, acle_id) == 0 && std::strcmp(acle_id, "bob") == 0 ? 0 : -1;
-}
-
-// Matches "*" and the identity itself; on a mismatch it leaves a record.
-kx_int32_t wildcard_with_record(char *id, char *acle_id) {
-    ++calls;
-    if (std::strcmp(acle_id, "*") == 0 || std::strcmp(id, acle_id) == 0)
-        return 0;
-    cu_set_error_1(99, nullptr, "other.cat", 1, 7, "mismatch");
-    return std::strcmp(id, acle_id) < 0 ? -1 : 1;
-}
-
-bytes handler_acl() {
-    return make_acl(
-        {make_subacl(SEC_ACLE_USER, 2, text_field("unix"), {rec(0x1, "alice"), rec(0x2, "bob")}),
-         make_subacl(SEC_ACLE_EXPANDED, 4, text_field("krb5"),
-                     {rec(0x10, "zed"), rec(0x20, "pat"), rec(0x40, "*"), rec(0x80, "pat")}),
-         make_subacl(SEC_ACLE_USER, 1, text_field("vgn2"), {rec(0x4, "carol")})});
-}
-
-TEST(Handlers, UserHandlerOnlyWithTheHandlerBit) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user), SEC_S_OK);
-    EXPECT_EQ(single(acl.get(), 4, "unix", nullptr, "u:bob").status, SEC_S_BAD_ACLE);
-    EXPECT_EQ(single(acl.get(), 4, "unix", nullptr, "Bob").perm, 0x2u);
-    EXPECT_EQ(calls, 0);
-    expect_ok(single(acl.get(), 0x84, "unix", nullptr, "u:bob"), 0x2);
-    EXPECT_EQ(calls, 2);
-    expect_no_entry(single(acl.get(), 0x84, "unix", nullptr, "bob"), 0x84, "unix", "bob");
-}
-
-TEST(Handlers, HandlerBitWithoutUserHandlerComparesTexts) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", prefixed_user), SEC_S_OK);
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "vgn2", prefixed_user), SEC_S_OK);
-    expect_ok(single(acl.get(), 0x84, "unix", nullptr, "BOB"), 0x2);
-    EXPECT_EQ(calls, 0);
-}
-
-TEST(Handlers, NegativeResultStopsTheUserWalk) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", says_before_unless_bob),
-              SEC_S_OK);
-    expect_no_entry(single(acl.get(), 0x84, "unix", nullptr, "bob"), 0x84, "unix", "bob");
-    EXPECT_EQ(calls, 1);
-}
-
-TEST(Handlers, ZmechSubaclWithTheHandlerOfMech) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user), SEC_S_OK);
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "vgn2", says_before_unless_bob),
-              SEC_S_OK);
-    expect_ok(single(acl.get(), 0x84, "unix", "vgn2", "u:carol"), 0x4);
-    EXPECT_EQ(calls, 1);
-}
-
-TEST(Handlers, ExpandedEntriesNeedTheirHandler) {
-    owned_acl acl(handler_acl());
-    // An identical identity does not match without a handler of type 1.
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "krb5", wildcard_with_record),
-              SEC_S_OK);
-    expect_no_entry(single(acl.get(), 8, "krb5", nullptr, "pat"), 8, "krb5", "pat");
-    EXPECT_EQ(calls, 0);
-
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "KRB5", wildcard_with_record),
-              SEC_S_OK);
-    // "zed" sorts after "pat", yet the walk goes on; the first of the two
-    // matching entries decides, and the rejections leave no record.
-    expect_ok(single(acl.get(), 8, "krb5", nullptr, "pat"), 0x20);
-    expect_ok(single(acl.get(), 8, "krb5", nullptr, "amy"), 0x40);
-}
-
-TEST(Handlers, RecordOfARejectingUserHandlerIsCleared) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", wildcard_with_record),
-              SEC_S_OK);
-    expect_ok(single(acl.get(), 0x84, "unix", nullptr, "bob"), 0x2);
-    expect_no_entry(single(acl.get(), 0x84, "unix", nullptr, "zoe"), 0x84, "unix", "zoe");
 }
 
 // Calls back into the library: registration takes the registry's mutex.
 kx_int32_t reentrant(char *id, char *acle_id) {
+    ++handler_calls;
     kx_uint32_t mask = 0;
     if (sec_translate_perms("rw", nullptr, &mask) != SEC_S_OK || mask != 0x3)
         return -1;
@@ -426,80 +298,122 @@ kx_int32_t reentrant(char *id, char *acle_id) {
     return cu_strcasecmp_posix_1(id, acle_id);
 }
 
-TEST(Handlers, HandlerMayCallIntoTheLibrary) {
-    owned_acl acl(handler_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", reentrant), SEC_S_OK);
-    expect_ok(single(acl.get(), 0x84, "unix", nullptr, "bob"), 0x2);
+// Registrations, then requests with the handler calls they make. The
+// registry keeps every registration of the process, so each case appends
+// its number to its mechanisms.
+struct handler_case {
+    std::vector<std::tuple<kx_uint32_t, const char *, sec_acl_id_handler>> registered;
+    struct step {
+        unsigned char type;
+        const char *mech, *zmech, *id;
+        kx_int32_t status;
+        kx_uint32_t perm;
+        int calls;
+    };
+    std::vector<step> asked;
+};
+
+std::string numbered(const char *mech, const std::string &n) {
+    return std::string(mech) += n;
+}
+
+bytes handler_acl(const std::string &n) {
+    return make_acl(
+        {make_subacl(SEC_ACLE_USER, 2, text_field(numbered("unix", n).c_str()),
+                     {rec(0x1, "alice"), rec(0x2, "bob")}),
+         make_subacl(SEC_ACLE_EXPANDED, 4, text_field(numbered("krb5", n).c_str()),
+                     {rec(0x10, "zed"), rec(0x20, "pat"), rec(0x40, "*"), rec(0x80, "pat")}),
+         make_subacl(SEC_ACLE_USER, 1, text_field(numbered("vgn2", n).c_str()),
+                     {rec(0x4, "carol")})});
+}
+
+TEST(Evaluation, ThroughHandlers) {
+    const kx_uint32_t user = SEC_ID_HANDLER_USER, expanded = SEC_ID_HANDLER_EXPANDED;
+    // clang-format off
+    const handler_case cases[] = {
+        // A user handler serves only requests with the handler bit.
+        {{{user, "unix", prefixed_user}},
+         {{4, "unix", {}, "u:bob", no, 0, 0}, {4, "unix", {}, "Bob", ok, 0x2, 0},
+          {0x84, "unix", {}, "u:bob", ok, 0x2, 2}, {0x84, "unix", {}, "bob", no, 0, 1}}},
+        // The handler bit without a user handler of the mech compares texts.
+        {{{expanded, "unix", prefixed_user}, {user, "vgn2", prefixed_user}},
+         {{0x84, "unix", {}, "BOB", ok, 0x2, 0}}},
+        // A negative answer stops the walk of user entries.
+        {{{user, "unix", says_before_unless_bob}}, {{0x84, "unix", {}, "bob", no, 0, 1}}},
+        // zmech's sub-ACL is walked with the handler of mech.
+        {{{user, "unix", prefixed_user}, {user, "vgn2", says_before_unless_bob}},
+         {{0x84, "unix", "vgn2", "u:carol", ok, 0x4, 1}}},
+        // Expanded entries match only through a handler of their type, even
+        // an identical identity.
+        {{{user, "krb5", wildcard_with_record}}, {{8, "krb5", {}, "pat", no, 0, 0}}},
+        // "zed" sorts after "pat", yet the walk goes on; the first of the two
+        // matching entries decides; the rejections' records are cleared.
+        {{{expanded, "KRB5", wildcard_with_record}},
+         {{8, "krb5", {}, "pat", ok, 0x20, 2}, {8, "krb5", {}, "amy", ok, 0x40, 3}}},
+        {{{user, "unix", wildcard_with_record}},
+         {{0x84, "unix", {}, "bob", ok, 0x2, 2}, {0x84, "unix", {}, "zoe", no, 0, 2}}},
+        {{{user, "unix", reentrant}}, {{0x84, "unix", {}, "bob", ok, 0x2, 2}}},
+    };
+    // clang-format on
+    for (std::size_t i = 0; i < std::size(cases); ++i) {
+        const std::string n = std::to_string(i);
+        for (auto [type, mech, handler] : cases[i].registered)
+            ASSERT_EQ(sec__register_id_handler(type, numbered(mech, n).c_str(), handler), SEC_S_OK);
+        owned_acl acl(handler_acl(n));
+        for (const handler_case::step &a : cases[i].asked) {
+            const std::string mech = numbered(a.mech, n),
+                              zmech = numbered(a.zmech ? a.zmech : "", n);
+            SCOPED_TRACE(mech + " " + a.id);
+            handler_calls = 0;
+            const request q{{}, a.type, mech.c_str(), {}, a.id, {}, a.status, a.perm, a.id};
+            expect_answer(
+                q, single(acl.get(), a.type, q.mech, a.zmech ? zmech.c_str() : nullptr, a.id));
+            EXPECT_EQ(handler_calls, a.calls);
+        }
+    }
+    // The reentrant handler's registrations, made with the registry in use.
     EXPECT_EQ(lookup(SEC_ID_HANDLER_USER, "alice"), handler_a);
     EXPECT_EQ(lookup(SEC_ID_HANDLER_USER, "bob"), handler_a);
 }
 
 // ---- buffers cut short -----------------------------------------------------
 
-// Each request's result and the message of its record (0 for none).
-struct answer {
-    result r;
-    int msg_num;
-};
-
-std::vector<answer> evaluate_all(sec_acl_buffer_t acl) {
-    std::vector<std::function<result()>> requests = {
-        [&] { return single(acl, 1, nullptr, nullptr, nullptr); },
-        [&] { return single(acl, 2, nullptr, nullptr, nullptr); },
-        [&] { return single(acl, 4, "unix", nullptr, "alice"); },
-        [&] { return single(acl, 4, "unix", nullptr, "bob"); },
-        [&] { return single(acl, 4, "unix", nullptr, "zed"); },
-        [&] { return single(acl, 0x84, "unix", nullptr, "bob"); },
-        [&] { return single(acl, 8, "krb5", nullptr, "pat"); },
-        [&] { return single(acl, 8, "krb5", nullptr, "amy"); },
-        [&] { return single(acl, 4, "vgn2", nullptr, "bob"); },
-        [&] {
-            return groups_of(acl, {"staff", "admin", "x"});
-        },
-        [&] { return groups_of(acl, {"nobody"}); },
-    };
-    std::vector<answer> answers;
-    for (auto &request : requests) {
-        result r = request();
-        answers.push_back({r, kxtest::last_error().msg_num});
-    }
-    return answers;
-}
-
-TEST(CorruptBuffers, TruncatedAtEveryLength) {
+// A cut buffer gives the whole buffer's answer where the sub-ACL asked for
+// is whole, and is refused otherwise; it is never read past its end.
+TEST(Evaluation, BuffersCutAtEveryLength) {
     ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", wildcard_with_record),
               SEC_S_OK);
-    bytes full = make_acl(
+    const bytes full = make_acl(
         {make_subacl(SEC_ACLE_UNAUTHENTICATED, 1, {}, {rec(0x1)}),
          make_subacl(SEC_ACLE_USER, 2, text_field("unix"), {rec(0x2, "alice"), rec(0x4, "bob")}),
          make_subacl(SEC_ACLE_EXPANDED, 2, text_field("krb5"), {rec(0x8, "pat"), rec(0x10, "*")}),
          make_subacl(SEC_ACLE_GROUP, 2, {}, {rec(0x20, "admin"), rec(0x40, "staff")}),
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x80)})});
-    owned_acl whole(full);
-    std::vector<answer> expected = evaluate_all(whole.get());
-    std::vector<kx_int32_t> statuses;
-    for (const answer &a : expected)
-        statuses.push_back(a.r.status);
-    ASSERT_EQ(statuses, (std::vector<kx_int32_t>{0, 0, 0, 0, 43, 0, 0, 0, 43, 0, 43}));
-
-    // A cut buffer gives the whole buffer's answer where the sub-ACL asked
-    // for is whole, and is refused otherwise; it is never read past its end.
-    for (std::size_t length = 0; length < full.size(); ++length) {
-        owned_acl cut(prefix(full, length));
-        std::vector<answer> got = evaluate_all(cut.get());
-        for (std::size_t i = 0; i < got.size(); ++i) {
-            SCOPED_TRACE("length " + std::to_string(length) + ", request " + std::to_string(i));
-            const answer &a = got[i];
-            if (a.r.status != SEC_S_BAD_ACL) {
-                EXPECT_EQ(a.r.status, expected[i].r.status);
-                EXPECT_EQ(a.r.perm, expected[i].r.perm);
-                EXPECT_EQ(a.msg_num, expected[i].msg_num);
+    // clang-format off
+    const request whole[] = {
+        {{}, 1, {}, {}, {}, {}, ok, 0x1}, {{}, 2, {}, {}, {}, {}, ok, 0x80},
+        {{}, 4, "unix", {}, "alice", {}, ok, 0x2}, {{}, 4, "unix", {}, "bob", {}, ok, 0x4},
+        {{}, 4, "unix", {}, "zed", {}, no, 0, "zed"}, {{}, 0x84, "unix", {}, "bob", {}, ok, 0x4},
+        {{}, 8, "krb5", {}, "pat", {}, ok, 0x8}, {{}, 8, "krb5", {}, "amy", {}, ok, 0x10},
+        {{}, 4, "vgn2", {}, "bob", {}, no, 0},
+        {{}, 16, {}, {}, {}, {"staff", "admin", "x"}, ok, 0x60},
+        {{}, 16, {}, {}, {}, {"nobody"}, no, 0},
+    };
+    // clang-format on
+    for (std::size_t length = 0; length <= full.size(); ++length) {
+        owned_acl cut(bytes(full.begin(), full.begin() + static_cast<std::ptrdiff_t>(length)));
+        for (const request &q : whole) {
+            SCOPED_TRACE(testing::Message() << "length " << length << ", type " << int(q.type)
+                                            << " " << (q.id ? q.id : "-"));
+            result r = ask(cut.get(), q);
+            if (r.status != SEC_S_BAD_ACL || length == full.size()) {
+                expect_answer(q, r);
             } else if (length < 5) {
-                EXPECT_EQ(a.msg_num, MSG_2650_109);
-                EXPECT_EQ(a.r.perm, untouched);
+                EXPECT_EQ(kxtest::last_error().msg_num, MSG_2650_109);
+                EXPECT_EQ(r.perm, untouched);
             } else {
-                EXPECT_EQ(a.msg_num, MSG_2650_110);
-                EXPECT_EQ(a.r.perm, 0u);
+                EXPECT_TRUE(record_at_source(SEC_S_BAD_ACL, MSG_2650_110));
+                EXPECT_EQ(r.perm, 0u);
             }
         }
     }
@@ -507,12 +421,17 @@ TEST(CorruptBuffers, TruncatedAtEveryLength) {
 
 // ---- Perf points -----------------------------------------------------------
 
-TEST(EvaluationTrace, PerfLevelTwoTimesBothEvaluations) {
-    std::string file = kxtest::start_tracing("_SEL:Perf=2");
+// Perf 1 times no evaluation; Perf 2 both kinds, an argument failure too.
+TEST(EvaluationTrace, PerfPoints) {
+    std::string file = kxtest::start_tracing("_SEL:Perf=1");
     owned_acl acl(example_acl());
+    const request groups{{}, 16, {}, {}, {}, {"staff"}, ok, 0x2};
+    single(acl.get(), 4, "unix", nullptr, "bob");
+    ask(acl.get(), groups);
+    ASSERT_EQ(tr_set_detail_level_1("_SEL", "Perf", 2), TR_OK);
     single(acl.get(), 0x84, "unix", nullptr, "bob");
     single(acl.get(), 4, "unix", nullptr, nullptr);
-    groups_of(acl.get(), {"staff"});
+    ask(acl.get(), groups);
 
     auto r = kxtest::read_trace(file);
     ASSERT_EQ(kxtest::trace_ids(file), (std::vector<unsigned>{0, 7, 7, 8}));
@@ -522,19 +441,11 @@ TEST(EvaluationTrace, PerfLevelTwoTimesBothEvaluations) {
     EXPECT_EQ(items(r[1].items.begin(), r[1].items.begin() + 4),
               (items{kxtest::hex_of(entries), kxtest::hex_of(type), kxtest::hex_text("unix"),
                      kxtest::hex_text("bob")}));
-    // An argument failure is timed too; it searched no sub-ACL.
+    // The argument failure searched no sub-ACL.
     EXPECT_EQ(items(r[2].items.begin(), r[2].items.begin() + 4),
               (items{kxtest::hex_of(none), kxtest::hex_of(user), kxtest::hex_text("unix"),
                      kxtest::hex_text("")}));
     EXPECT_EQ(r[3].items.size(), 3u);
-}
-
-TEST(EvaluationTrace, OtherPerfLevelsTimeNothing) {
-    std::string file = kxtest::start_tracing("_SEL:Perf=1");
-    owned_acl acl(example_acl());
-    single(acl.get(), 4, "unix", nullptr, "bob");
-    groups_of(acl.get(), {"staff"});
-    EXPECT_EQ(kxtest::trace_ids(file), (std::vector<unsigned>{0}));
 }
 
 } // namespace
