@@ -1,6 +1,6 @@
 // Helpers of the evaluation tests, on top of the shared ACL buffer fixtures:
-// identified entry records, the ACL of the evaluation examples, group lists,
-// the two evaluation calls as values, and identity handlers.
+// identified entry records, two ACLs, group lists, the two evaluation calls
+// as values, and identity handlers.
 #ifndef KXACL_TEST_EVAL_FIXTURES_H
 #define KXACL_TEST_EVAL_FIXTURES_H
 
@@ -14,12 +14,7 @@
 
 namespace evaltest {
 
-using kxtest::bytes;
-using kxtest::make_acl;
-using kxtest::make_record;
-using kxtest::make_subacl;
-using kxtest::owned_acl;
-using kxtest::text_field;
+using namespace kxtest;
 
 inline bytes rec(kx_uint32_t perm, const char *id = nullptr) {
     return id ? make_record(perm, text_field(id)) : make_record(perm);
@@ -34,8 +29,8 @@ inline bytes example_acl() {
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
 }
 
-// Entries of every kind that needs no handler or has one of "unix" or "krb5".
-inline bytes rich_acl() {
+// Entries of every kind but unauthenticated, the expanded ones for a handler.
+inline bytes sample_acl() {
     return make_acl(
         {make_subacl(SEC_ACLE_USER, 4, text_field("unix"),
                      {rec(0x1, "alice"), rec(0x2, "bob"), rec(0x4, "carol"), rec(0x8, "dave")}),
@@ -45,18 +40,14 @@ inline bytes rich_acl() {
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x80)})});
 }
 
-class group_list {
-  public:
-    explicit group_list(std::vector<const char *> names) {
-        for (const char *n : names)
-            groups_.push_back({0, const_cast<char *>(n)});
-    }
-    kx_int32_t count() const { return static_cast<kx_int32_t>(groups_.size()); }
-    sec_buffer_t get() { return groups_.data(); }
+using group_list = std::vector<sec_buffer_s>;
 
-  private:
-    std::vector<sec_buffer_s> groups_;
-};
+inline group_list groups_named(const std::vector<const char *> &names) {
+    group_list groups;
+    for (const char *n : names)
+        groups.push_back({0, const_cast<char *>(n)});
+    return groups;
+}
 
 constexpr kx_uint32_t untouched = 0xdeadbeef;
 
@@ -74,10 +65,14 @@ inline result single(sec_acl_buffer_t acl, unsigned char type, const char *mech,
     return r;
 }
 
-inline result groups_of(sec_acl_buffer_t acl, group_list &groups) {
+// A null list when empty.
+inline result groups_of(sec_acl_buffer_t acl, group_list &groups, kx_int32_t count) {
     result r{0, untouched};
-    r.status = sec__group_acles_perm(acl, groups.count(), groups.get(), &r.perm);
+    r.status = sec__group_acles_perm(acl, count, groups.empty() ? nullptr : groups.data(), &r.perm);
     return r;
+}
+inline result groups_of(sec_acl_buffer_t acl, group_list &groups) {
+    return groups_of(acl, groups, static_cast<kx_int32_t>(groups.size()));
 }
 
 inline std::atomic<int> handler_calls{0};
@@ -85,9 +80,7 @@ inline std::atomic<int> handler_calls{0};
 // Accepts "u:<name>" for the entry <name>, ordering like the plain comparison.
 inline kx_int32_t prefixed_user(char *id, char *acle_id) {
     ++handler_calls;
-    if (std::strncmp(id, "u:", 2) != 0)
-        return -1;
-    return cu_strcasecmp_posix_1(id + 2, acle_id);
+    return std::strncmp(id, "u:", 2) != 0 ? -1 : cu_strcasecmp_posix_1(id + 2, acle_id);
 }
 
 // Matches "*" and the identity itself; on a mismatch it leaves a record,

@@ -31,8 +31,8 @@ kx_uint32_t type_of(int i) {
     return i % 2 ? SEC_ID_HANDLER_USER : SEC_ID_HANDLER_EXPANDED;
 }
 
-// One round of requests; counts the answers that differ from the expected
-// ones. The expanded handler leaves records that each thread must clear.
+// The answers of one round that differ from the expected ones. The
+// expanded handler leaves records that each thread must clear.
 int wrong_answers(sec_acl_buffer_t acl, group_list &groups) {
     const struct {
         unsigned char type;
@@ -47,41 +47,39 @@ int wrong_answers(sec_acl_buffer_t acl, group_list &groups) {
         {SEC_ACLE_EXPANDED, "krb5", "amy", {SEC_S_OK, 0x40}},
         {SEC_ACLE_ANYOTHER, nullptr, nullptr, {SEC_S_OK, 0x80}},
     };
-    int wrong = 0;
+    result r = groups_of(acl, groups);
+    int wrong = r.status != SEC_S_OK || r.perm != 0x300;
     for (const auto &q : requests) {
-        result r = single(acl, q.type, q.mech, nullptr, q.id);
+        r = single(acl, q.type, q.mech, nullptr, q.id);
         wrong += r.status != q.answer.status || r.perm != q.answer.perm;
     }
-    result r = groups_of(acl, groups);
-    return wrong + (r.status != SEC_S_OK || r.perm != 0x300);
+    return wrong;
 }
 
 TEST(EvaluationThreads, EvaluateWhileRegistering) {
-    owned_acl acl(rich_acl());
+    owned_acl acl(sample_acl());
     ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user), SEC_S_OK);
     ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", wildcard_with_record),
               SEC_S_OK);
-
     constexpr int evaluators = 4, registrars = 2, rounds = 1000, registrations = 500;
     std::atomic<int> wrong{0}, failed_registrations{0};
     std::vector<std::thread> threads;
     for (int t = 0; t < evaluators; ++t)
         threads.emplace_back([&] {
-            group_list groups({"staff", "nobody", "ADMIN"});
+            group_list groups = groups_named({"staff", "nobody", "ADMIN"});
             for (int i = 0; i < rounds; ++i)
                 wrong += wrong_answers(acl.get(), groups);
         });
+    // Other mechanisms, and the ones in use, which must stay unreached.
     for (int t = 0; t < registrars; ++t)
         threads.emplace_back([&, t] {
-            // Other mechanisms, and the ones in use, which must stay unreached.
             for (int i = 0; i < registrations; ++i)
-                if (sec__register_id_handler(type_of(i), mech_of(t, i).c_str(), late) != SEC_S_OK ||
-                    sec__register_id_handler(type_of(i), i % 2 ? "UNIX" : "Krb5", late) != SEC_S_OK)
-                    ++failed_registrations;
+                failed_registrations +=
+                    sec__register_id_handler(type_of(i), mech_of(t, i).c_str(), late) != SEC_S_OK ||
+                    sec__register_id_handler(type_of(i), i % 2 ? "UNIX" : "Krb5", late) != SEC_S_OK;
         });
     for (auto &t : threads)
         t.join();
-
     EXPECT_EQ(wrong, 0);
     EXPECT_EQ(failed_registrations, 0);
     // No registration was lost while the registry grew.
