@@ -1,10 +1,10 @@
 // Counts every heap allocation of the process while evaluations run, by
 // taking the place of the C library's allocation functions (and so of
-// operator new). Evaluations with tracing off allocate nothing, but for a
-// thread's first refusal record. An executable of its own because it
-// replaces the whole process's allocator; not built under the sanitizers.
-#include <cstring>
-
+// operator new). Once each request has been made, evaluations with tracing
+// off allocate nothing: the records of refusals and of rejecting handlers
+// take the block of the record that the call cleared. An executable of its
+// own because it replaces the whole process's allocator; not built under
+// the sanitizers.
 #include <gtest/gtest.h>
 
 #include <kx_acl.h>
@@ -24,48 +24,23 @@ template <typename Work> long allocations_of(Work work) {
     return kxtest::heap::stop_counting();
 }
 
-// Accepts "pat" alone, allocating nothing (nor any record) for the others.
-kx_int32_t only_pat(char *id, char *acle_id) {
-    return std::strcmp(id, "pat") == 0 && std::strcmp(acle_id, "pat") == 0 ? 0 : 1;
-}
-
 TEST(EvaluationAllocCount, EvaluationsAllocateNothing) {
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user), SEC_S_OK);
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", only_pat), SEC_S_OK);
+    ASSERT_EQ(register_sample_handlers(), SEC_S_OK);
     owned_acl acl(sample_acl());
-    group_list groups = groups_named({"wheel", "staff", "nobody", "admin"});
-    const struct {
-        unsigned char type;
-        const char *mech, *id;
-        result answer;
-    } requests[] = {
-        {SEC_ACLE_ANYOTHER, nullptr, nullptr, {SEC_S_OK, 0x80}},
-        {SEC_ACLE_USER, "unix", "alice", {SEC_S_OK, 0x1}},
-        {SEC_ACLE_USER, "UNIX", "Dave", {SEC_S_OK, 0x8}},
-        {SEC_ACLE_USER | SEC_ACLE_HANDLER_BIT, "unix", "u:carol", {SEC_S_OK, 0x4}},
-        {SEC_ACLE_EXPANDED, "krb5", "pat", {SEC_S_OK, 0x20}}, // after a rejection
-        {SEC_ACLE_GROUP, nullptr, nullptr, {SEC_S_OK, 0x300}},
-        // A refusal's record takes the block of the record the call cleared:
-        // shorter, then longer than the one before.
-        {SEC_ACLE_USER, "unix", "zed", {SEC_S_BAD_ACLE, 0}},
-        {SEC_ACLE_USER, "unix", "aaron", {SEC_S_BAD_ACLE, 0}},
-    };
-    auto ask = [&](const auto &q) {
-        return q.type == SEC_ACLE_GROUP ? groups_of(acl.get(), groups)
-                                        : single(acl.get(), q.type, q.mech, nullptr, q.id);
-    };
-    // The first call of the process registers tracing, which may allocate;
-    // the first refusal of a thread makes its record block.
-    ASSERT_EQ(ask(requests[0]).status, SEC_S_OK);
-    EXPECT_GT(allocations_of([&] { ask(requests[7]); }), 0);
-
+    group_list groups = groups_named(sample_groups);
+    // The first round registers tracing and makes the thread's record.
+    EXPECT_GT(allocations_of([&] {
+                  for (const sample_request &q : sample_requests)
+                      ask_sample(acl.get(), groups, q);
+              }),
+              0);
     const unsigned long library_before = kxacl::mem_allocations();
-    for (const auto &q : requests) {
+    for (const sample_request &q : sample_requests) {
         SCOPED_TRACE(testing::Message() << int(q.type) << " " << (q.id ? q.id : "-"));
         result r{};
         EXPECT_EQ(allocations_of([&] {
                       for (int i = 0; i < 100; ++i)
-                          r = ask(q);
+                          r = ask_sample(acl.get(), groups, q);
                   }),
                   0);
         EXPECT_EQ(r.status, q.answer.status);

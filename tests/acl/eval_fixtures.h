@@ -20,15 +20,6 @@ inline bytes rec(kx_uint32_t perm, const char *id = nullptr) {
     return id ? make_record(perm, text_field(id)) : make_record(perm);
 }
 
-// User entries of "unix" (alice 0x3, bob 0x1), group entries (admin 0x4,
-// staff 0x2) and an anyother entry 0x1.
-inline bytes example_acl() {
-    return make_acl(
-        {make_subacl(SEC_ACLE_USER, 2, text_field("unix"), {rec(0x3, "alice"), rec(0x1, "bob")}),
-         make_subacl(SEC_ACLE_GROUP, 2, {}, {rec(0x4, "admin"), rec(0x2, "staff")}),
-         make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x1)})});
-}
-
 // Entries of every kind but unauthenticated, the expanded ones for a handler.
 inline bytes sample_acl() {
     return make_acl(
@@ -71,9 +62,6 @@ inline result groups_of(sec_acl_buffer_t acl, group_list &groups, kx_int32_t cou
     r.status = sec__group_acles_perm(acl, count, groups.empty() ? nullptr : groups.data(), &r.perm);
     return r;
 }
-inline result groups_of(sec_acl_buffer_t acl, group_list &groups) {
-    return groups_of(acl, groups, static_cast<kx_int32_t>(groups.size()));
-}
 
 inline std::atomic<int> handler_calls{0};
 
@@ -91,6 +79,39 @@ inline kx_int32_t wildcard_with_record(char *id, char *acle_id) {
         return 0;
     cu_set_error_1(99, nullptr, "other.cat", 1, 7, "mismatch");
     return std::strcmp(id, acle_id) < 0 ? -1 : 1;
+}
+
+// Requests on sample_acl with prefixed_user and wildcard_with_record
+// registered (see register_sample_handlers), and their answers. The group
+// request asks for sample_groups.
+struct sample_request {
+    unsigned char type;
+    const char *mech, *id;
+    result answer;
+};
+inline const sample_request sample_requests[] = {
+    {SEC_ACLE_ANYOTHER, nullptr, nullptr, {SEC_S_OK, 0x80}},
+    {SEC_ACLE_USER, "unix", "alice", {SEC_S_OK, 0x1}},
+    {SEC_ACLE_USER, "UNIX", "Dave", {SEC_S_OK, 0x8}},
+    {SEC_ACLE_USER, "unix", "u:bob", {SEC_S_BAD_ACLE, 0}},
+    {SEC_ACLE_USER | SEC_ACLE_HANDLER_BIT, "UNIX", "u:carol", {SEC_S_OK, 0x4}},
+    {SEC_ACLE_USER | SEC_ACLE_HANDLER_BIT, "unix", "u:aaron", {SEC_S_BAD_ACLE, 0}},
+    {SEC_ACLE_EXPANDED, "krb5", "pat", {SEC_S_OK, 0x20}}, // after a rejection
+    {SEC_ACLE_EXPANDED, "krb5", "amy", {SEC_S_OK, 0x40}},
+    {SEC_ACLE_GROUP, nullptr, nullptr, {SEC_S_OK, 0x300}},
+    {SEC_ACLE_USER, "unix", "zed", {SEC_S_BAD_ACLE, 0}},
+};
+inline const std::vector<const char *> sample_groups = {"wheel", "staff", "nobody", "ADMIN"};
+
+inline kx_int32_t register_sample_handlers() {
+    kx_int32_t rc = sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user);
+    return rc ? rc
+              : sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", wildcard_with_record);
+}
+
+inline result ask_sample(sec_acl_buffer_t acl, group_list &groups, const sample_request &q) {
+    return q.type == SEC_ACLE_GROUP ? groups_of(acl, groups, static_cast<kx_int32_t>(groups.size()))
+                                    : single(acl, q.type, q.mech, nullptr, q.id);
 }
 
 } // namespace evaltest

@@ -31,44 +31,21 @@ kx_uint32_t type_of(int i) {
     return i % 2 ? SEC_ID_HANDLER_USER : SEC_ID_HANDLER_EXPANDED;
 }
 
-// The answers of one round that differ from the expected ones. The
-// expanded handler leaves records that each thread must clear.
-int wrong_answers(sec_acl_buffer_t acl, group_list &groups) {
-    const struct {
-        unsigned char type;
-        const char *mech, *id;
-        result answer;
-    } requests[] = {
-        {SEC_ACLE_USER, "unix", "Bob", {SEC_S_OK, 0x2}},
-        {SEC_ACLE_USER, "unix", "u:bob", {SEC_S_BAD_ACLE, 0}},
-        {SEC_ACLE_USER | SEC_ACLE_HANDLER_BIT, "UNIX", "u:carol", {SEC_S_OK, 0x4}},
-        {SEC_ACLE_USER | SEC_ACLE_HANDLER_BIT, "unix", "u:aaron", {SEC_S_BAD_ACLE, 0}},
-        {SEC_ACLE_EXPANDED, "krb5", "pat", {SEC_S_OK, 0x20}},
-        {SEC_ACLE_EXPANDED, "krb5", "amy", {SEC_S_OK, 0x40}},
-        {SEC_ACLE_ANYOTHER, nullptr, nullptr, {SEC_S_OK, 0x80}},
-    };
-    result r = groups_of(acl, groups);
-    int wrong = r.status != SEC_S_OK || r.perm != 0x300;
-    for (const auto &q : requests) {
-        r = single(acl, q.type, q.mech, nullptr, q.id);
-        wrong += r.status != q.answer.status || r.perm != q.answer.perm;
-    }
-    return wrong;
-}
-
 TEST(EvaluationThreads, EvaluateWhileRegistering) {
     owned_acl acl(sample_acl());
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user), SEC_S_OK);
-    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", wildcard_with_record),
-              SEC_S_OK);
+    ASSERT_EQ(register_sample_handlers(), SEC_S_OK);
     constexpr int evaluators = 4, registrars = 2, rounds = 1000, registrations = 500;
     std::atomic<int> wrong{0}, failed_registrations{0};
     std::vector<std::thread> threads;
+    // The expanded handler leaves records that each thread must clear.
     for (int t = 0; t < evaluators; ++t)
         threads.emplace_back([&] {
-            group_list groups = groups_named({"staff", "nobody", "ADMIN"});
+            group_list groups = groups_named(sample_groups);
             for (int i = 0; i < rounds; ++i)
-                wrong += wrong_answers(acl.get(), groups);
+                for (const sample_request &q : sample_requests) {
+                    result r = ask_sample(acl.get(), groups, q);
+                    wrong += r.status != q.answer.status || r.perm != q.answer.perm;
+                }
         });
     // Other mechanisms, and the ones in use, which must stay unreached.
     for (int t = 0; t < registrars; ++t)
