@@ -1,18 +1,10 @@
-// Counts every heap allocation of the process while evaluations run, by
-// taking the place of the C library's allocation functions (and so of
-// operator new). Once each request has been made, evaluations with tracing
+// Counts every heap allocation of the process (malloc replaced) while
+// evaluations run. Once each request has been made, evaluations with tracing
 // off allocate nothing: the records of refusals and of rejecting handlers
-// take the block of the record that the call cleared. An executable of its
-// own because it replaces the whole process's allocator; not built under
-// the sanitizers.
-#include <gtest/gtest.h>
-
-#include <kx_acl.h>
-
-#include "alloc.h"
+// take the block of the record the call cleared. An executable of its own,
+// as it replaces the process's allocator; not built under the sanitizers.
 #include "eval_fixtures.h"
 #include "heap.h"
-#include "messages.h"
 
 namespace {
 

@@ -1,14 +1,10 @@
-// Helpers of the evaluation tests, on top of the shared ACL buffer fixtures:
-// identified entry records, two ACLs, group lists, the two evaluation calls
-// as values, and identity handlers.
+// Helpers of the evaluation tests: an ACL of every kind of entry, the two
+// evaluation calls as values, identity handlers, and requests with answers.
 #ifndef KXACL_TEST_EVAL_FIXTURES_H
 #define KXACL_TEST_EVAL_FIXTURES_H
 
 #include <atomic>
 #include <cstring>
-#include <vector>
-
-#include <kx_acl.h>
 
 #include "acl_fixtures.h"
 
@@ -40,9 +36,8 @@ inline group_list groups_named(const std::vector<const char *> &names) {
     return groups;
 }
 
-constexpr kx_uint32_t untouched = 0xdeadbeef;
+constexpr kx_uint32_t untouched = 0xdeadbeef; // a result's perm before the call
 
-// The outcome of one evaluation; perm starts as `untouched`.
 struct result {
     kx_int32_t status;
     kx_uint32_t perm;
@@ -56,7 +51,6 @@ inline result single(sec_acl_buffer_t acl, unsigned char type, const char *mech,
     return r;
 }
 
-// A null list when empty.
 inline result groups_of(sec_acl_buffer_t acl, group_list &groups, kx_int32_t count) {
     result r{0, untouched};
     r.status = sec__group_acles_perm(acl, count, groups.empty() ? nullptr : groups.data(), &r.perm);

@@ -1,24 +1,15 @@
-// Permission evaluation and the identity handler registry: tables of
-// requests with their answers and records, with and without handlers, the
-// walk against the text comparison, buffers cut or counted past their end,
-// and the Perf points. Argument refusals and the API points are in the
-// tables of api_table_test.
+// Permission evaluation and the identity handler registry: requests with
+// their answers and records, with and without handlers, on buffers whole,
+// cut or counted past their end; the Perf points. Argument refusals and the
+// API points are in the tables of api_table_test.
 #include <optional>
-#include <string>
 #include <tuple>
 #include <utility>
-#include <vector>
 
-#include <gtest/gtest.h>
-
-#include <kx_acl.h>
 #include <kx_tr.h>
 
-#include "alloc.h"
 #include "eval.h"
 #include "eval_fixtures.h"
-#include "messages.h"
-#include "support.h"
 
 using namespace kxacl;
 using namespace evaltest;
@@ -202,12 +193,9 @@ TEST(Evaluation, BuffersCutAtEveryLength) {
     }
 }
 
-kx_int32_t handler_a(char *, char *) {
-    return 0;
-}
-kx_int32_t handler_b(char *, char *) {
-    return 0;
-}
+// Registered only to be found again.
+const sec_acl_id_handler handler_a = [](char *, char *) -> kx_int32_t { return 0; };
+const sec_acl_id_handler handler_b = [](char *, char *) -> kx_int32_t { return 1; };
 
 sec_acl_id_handler lookup(kx_uint32_t type, const char *mech) {
     sec_acl_id_handler h = handler_b;
@@ -259,9 +247,8 @@ kx_int32_t reentrant(char *id, char *acle_id) {
     return cu_strcasecmp_posix_1(id, acle_id);
 }
 
-// Registrations, then requests with the handler calls they make. The
-// registry keeps every registration of the process, so each case appends
-// its number to its mechanisms.
+// Registrations, then requests with the handler calls they make. Each case
+// appends its number to its mechanisms: registrations last the process.
 struct handler_case {
     std::vector<std::tuple<kx_uint32_t, const char *, sec_acl_id_handler>> registered;
     struct step {

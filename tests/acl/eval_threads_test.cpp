@@ -1,14 +1,7 @@
 // Evaluation from many threads at once while other threads register
 // handlers, so that the registry's array grows and moves under the
 // lookups. Meant to run under ThreadSanitizer as well as plainly.
-#include <atomic>
-#include <string>
 #include <thread>
-#include <vector>
-
-#include <gtest/gtest.h>
-
-#include <kx_acl.h>
 
 #include "eval.h"
 #include "eval_fixtures.h"
@@ -26,7 +19,6 @@ kx_int32_t late(char *, char *) {
 std::string mech_of(int registrar, int i) {
     return std::to_string(registrar) + '-' + std::to_string(i);
 }
-
 kx_uint32_t type_of(int i) {
     return i % 2 ? SEC_ID_HANDLER_USER : SEC_ID_HANDLER_EXPANDED;
 }
