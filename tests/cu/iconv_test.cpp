@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "cu_test.h"
+#include "unique_mem.h"
 
 namespace {
 
