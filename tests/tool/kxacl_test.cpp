@@ -43,20 +43,18 @@ expected_run gives(strings args, int exit_code, std::string out, std::string err
     return {std::move(args), exit_code, std::move(out), std::move(err)};
 }
 
-void expect_text(const std::string &actual, const std::string &expected) {
-    if (expected.ends_with("..."))
-        EXPECT_EQ(actual.substr(0, expected.size() - 3), expected.substr(0, expected.size() - 3));
-    else
-        EXPECT_EQ(actual, expected);
-}
-
 void expect_runs(const std::vector<expected_run> &runs) {
     for (const auto &e : runs) {
         SCOPED_TRACE(testing::PrintToString(e.args));
         const auto r = run_kxacl(e.args);
         EXPECT_EQ(r.exit_code, e.exit_code) << r.err;
-        expect_text(r.out, e.out);
-        expect_text(r.err, e.err);
+        for (auto [actual, expected] : {std::pair{r.out, e.out}, {r.err, e.err}}) {
+            if (expected.ends_with("...")) {
+                expected.resize(expected.size() - 3);
+                actual.resize(std::min(actual.size(), expected.size()));
+            }
+            EXPECT_EQ(actual, expected);
+        }
     }
 }
 
@@ -260,16 +258,6 @@ std::string flip_case(std::mt19937 &rng, std::string s) {
     return s;
 }
 
-strings check_args(const json &a) {
-    const std::string question = a["question"];
-    strings args{"--" + std::string(question == "groups" ? "group" : question)};
-    if (!a["mech"].is_null())
-        args.push_back(a["mech"]);
-    for (const auto &id : a["ids"])
-        args.push_back(id);
-    return args;
-}
-
 TEST_F(KxaclTool, ExplainAnswersAsCheckDoes) {
     std::mt19937 rng(17);
     int decided = 0, undecided = 0;
@@ -285,9 +273,12 @@ TEST_F(KxaclTool, ExplainAnswersAsCheckDoes) {
                        flip_case(rng, groups[rng() % 4]), flip_case(rng, groups[rng() % 4])}));
         ASSERT_EQ(j["answers"].size(), 7u) << j;
         for (const json &a : j["answers"]) {
-            strings args{"check", acl, "--json"};
-            for (const auto &arg : check_args(a))
-                args.push_back(arg);
+            const std::string question = a["question"];
+            strings args{"check", acl, "--json",
+                         question == "groups" ? "--group" : "--" + question};
+            if (!a["mech"].is_null())
+                args.push_back(a["mech"]);
+            args.insert(args.end(), a["ids"].begin(), a["ids"].end());
             const json c = parsed(run_kxacl(args));
             SCOPED_TRACE(made.text + a.dump());
             EXPECT_EQ(c["entry"], a["entry"]);
@@ -510,9 +501,8 @@ TEST_F(KxaclTool, LintFindsCacheStatesAndTheirFixes) {
 TEST_F(KxaclTool, LintIsSilentOnTheExampleFile) {
     kxtest::write_file(acl, kxtest::read_file(KXACL_EXAMPLE_ACL));
     kxtest::shift_mtime(acl, -10);
-    expect_runs({gives({"lint", acl}, 0, "")}); // without its cached file
-    ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    expect_runs({gives({"lint", acl}, 0, "")});
+    expect_runs({gives({"lint", acl}, 0, ""), // without its cached file
+                 gives({"compile", acl, "--cache"}, 0, "..."), gives({"lint", acl}, 0, "")});
 }
 
 TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWholeOrRefuse) {
