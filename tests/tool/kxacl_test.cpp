@@ -21,15 +21,9 @@ using strings = std::vector<std::string>;
 
 namespace {
 
-constexpr const char *example_acl = "#ACL for the example resource\n"
-                                    "\n"
-                                    "N\n"
-                                    "o r\n"
-                                    "U UNIX root rwcx #administrator\n"
-                                    "u unix joe\n"
-                                    "g staff rw\n"
-                                    "g admin rwcxCqledvsao\n"
-                                    "e unix joe w\n";
+constexpr const char *example_acl = "#ACL for the example resource\n\nN\no r\n"
+                                    "U UNIX root rwcx #administrator\nu unix joe\n"
+                                    "g staff rw\ng admin rwcxCqledvsao\ne unix joe w\n";
 
 // A run and what it gives: output and error whole, or only their start
 // where the expectation ends in "...".
@@ -429,15 +423,9 @@ std::vector<std::string> lint_codes(const std::string &file) {
 
 TEST_F(KxaclTool, LintFindsEachPlantedEntryProblem) {
     kxtest::write_file(acl,
-                       "# planted problems\n"
-                       "n rx\n"
-                       "o rx\n"
-                       "u unix root rwcxCqledvsao\n"
-                       "u unix bob@fe80:0:0:0:0:0:0:1 rx\n"
-                       "u unx ann@h rx\n"
-                       "u unix carl@h r\n"
-                       "g admins rwcxCqledvsao\n"
-                       "e vgn2 svc@ rx\n",
+                       "# planted problems\nn rx\no rx\nu unix root rwcxCqledvsao\n"
+                       "u unix bob@fe80:0:0:0:0:0:0:1 rx\nu unx ann@h rx\nu unix carl@h r\n"
+                       "g admins rwcxCqledvsao\ne vgn2 svc@ rx\n",
                        0664);
     EXPECT_EQ(lint_codes(acl),
               (std::vector<std::string>{"KX105@2", "KX101@4", "KX102@5", "KX103@6", "KX104@7",
