@@ -106,8 +106,20 @@ TEST_F(KxaclTool, CompileWritesTheBufferAndTheCacheOrRefuses) {
     EXPECT_EQ(files(), (strings{"out.buf", "res.acl"}));
 }
 
-TEST_F(KxaclTool, CompileCacheSaysWhatBecameOfTheCachedFile) {
+// Editing never touches a cached file in place; compile --cache says what
+// became of it.
+TEST_F(KxaclTool, CachedFileIsNotEditedAndCompileSaysWhatBecameOfIt) {
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
+    const std::string cached = kxtest::read_file(cacl);
+    expect_runs({
+        gives({"del", cacl, "--anyother"}, 2, "",
+              "kxacl: refusing to write " + cacl +
+                  ": cached compiled files are written by the library only (use -o)\n"),
+        // Written elsewhere, the cached file stays as it was.
+        gives({"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"),
+        gives({"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"),
+    });
+    EXPECT_EQ(kxtest::read_file(cacl), cached);
     // An older-dated text replaces the one the cached file was compiled from.
     kxtest::write_file(acl, "o rwx\n");
     kxtest::shift_mtime(acl, -20);
@@ -189,11 +201,8 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
               "user krb5 root: no entry\n  no user entry of mechanism krb5\n"
               "anyother: r 0x00000001\n  decided by entry 6: o r\n"
               "unauthenticated: - 0x00000000\n  decided by entry 7: n\n"),
-        gives({"dump", acl}, 0,
-              "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n\tByte Ordering: 2\n"
-              "\tNumber of sub-ACLs: 5\n\tSubacl:\n"
-              "\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)\n\n"
-              "\t\ttype = e; mech = unix; id = joe; permission = w\n..."),
+        // The library's dump, whose lines its own tests check.
+        gives({"dump", acl}, 0, "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n..."),
         gives({"dump", buf, "--json"}, 0,
               R"({"lines":["ACL descriptor: 139 byte(s) long","\tVersion: 1",)"
               R"("\tByte Ordering: 2","\tNumber of sub-ACLs: 5","\tSubacl:",)"
@@ -524,20 +533,6 @@ TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWholeOrRefuse) {
     });
     EXPECT_EQ(kxtest::status_of(buf).st_mode & 07777, 0640u);
     EXPECT_EQ(files(), (strings{"res.acl", "res.buf"}));
-}
-
-TEST_F(KxaclTool, EditingNeverTouchesACachedFileInPlace) {
-    ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    const std::string before = kxtest::read_file(cacl);
-    expect_runs({
-        gives({"del", cacl, "--anyother"}, 2, "",
-              "kxacl: refusing to write " + cacl +
-                  ": cached compiled files are written by the library only (use -o)\n"),
-        // Written elsewhere, the cached file stays as it was.
-        gives({"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"),
-        gives({"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"),
-    });
-    EXPECT_EQ(kxtest::read_file(cacl), before);
 }
 
 // A FIFO, a device or a directory is neither read (a FIFO would hang the
