@@ -155,7 +155,8 @@ TEST_F(MessageTest, ConversionsHonourFlagsWidthPrecisionAndLength) {
                         1000.0, 0.5, reinterpret_cast<void *>(0x1234), 2.5L),
               "[   ab][xy][3.14][1.000000e+03][0.5][0x1234][2.500]");
     EXPECT_EQ(formatted("%2$s failed with %1$d (%2$s)", 13, "open"), "open failed with 13 (open)");
-    EXPECT_EQ(formatted("%s has %d entries, 100%% full", "acl", 3), "acl has 3 entries, 100% full");
+    EXPECT_EQ(formatted("%s has %05i entries, 100%% full", "acl", 3),
+              "acl has 00003 entries, 100% full");
 }
 
 // What a hostile translation could do with an int and a text argument: a
