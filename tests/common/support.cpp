@@ -12,20 +12,20 @@
 
 namespace kxtest {
 
-long long error_record::num(std::size_t i) const {
-    if (i >= args.size() || !std::holds_alternative<long long>(args[i])) {
-        ADD_FAILURE() << "argument " << i << " is not a number";
-        return -1;
-    }
-    return std::get<long long>(args[i]);
+namespace {
+template <typename T> T argument(const std::vector<arg> &args, std::size_t i, T otherwise) {
+    if (i < args.size() && std::holds_alternative<T>(args[i]))
+        return std::get<T>(args[i]);
+    ADD_FAILURE() << "argument " << i << " is missing or of another kind";
+    return otherwise;
 }
+} // namespace
 
+long long error_record::num(std::size_t i) const {
+    return argument<long long>(args, i, -1);
+}
 std::string error_record::str(std::size_t i) const {
-    if (i >= args.size() || !std::holds_alternative<std::string>(args[i])) {
-        ADD_FAILURE() << "argument " << i << " is not a text";
-        return "";
-    }
-    return std::get<std::string>(args[i]);
+    return argument<std::string>(args, i, "");
 }
 
 error_record last_error() {
@@ -38,20 +38,13 @@ error_record last_error() {
     r.catalogue = err->cu_msg_cat ? err->cu_msg_cat : "";
     for (kx_uint32_t i = 0; i < err->cu_arg_cnt; ++i) {
         const cu_error_arg_t &a = err->cu_args[i];
-        switch (a.cu_arg_type) {
-        case CU_ERROR_ARG_CHAR_STR:
-            r.args.emplace_back(std::string(a.cu_arg_value.cu_arg_char_str));
-            break;
-        case CU_ERROR_ARG_LONG:
-            r.args.emplace_back(static_cast<long long>(a.cu_arg_value.cu_arg_long));
-            break;
-        case CU_ERROR_ARG_LONG_LONG:
-            r.args.emplace_back(a.cu_arg_value.cu_arg_long_long);
-            break;
-        default:
-            r.args.emplace_back(static_cast<long long>(a.cu_arg_value.cu_arg_int));
-            break;
-        }
+        const auto &v = a.cu_arg_value;
+        if (a.cu_arg_type == CU_ERROR_ARG_CHAR_STR)
+            r.args.emplace_back(std::string(v.cu_arg_char_str));
+        else
+            r.args.emplace_back(a.cu_arg_type == CU_ERROR_ARG_LONG        ? v.cu_arg_long
+                                : a.cu_arg_type == CU_ERROR_ARG_LONG_LONG ? v.cu_arg_long_long
+                                                                          : v.cu_arg_int);
     }
     char *msg = nullptr;
     cu_get_errmsg_1(err, &msg);
@@ -192,12 +185,10 @@ std::vector<unsigned> trace_ids(const std::string &file) {
 }
 
 std::string hex_of(const void *p, std::size_t n) {
-    static const char digits[] = "0123456789abcdef";
     std::string s;
     for (std::size_t i = 0; i < n; ++i) {
-        unsigned char b = static_cast<const unsigned char *>(p)[i];
-        s += digits[b >> 4];
-        s += digits[b & 15];
+        const unsigned char b = static_cast<const unsigned char *>(p)[i];
+        s += {"0123456789abcdef"[b >> 4], "0123456789abcdef"[b & 15]};
     }
     return s;
 }

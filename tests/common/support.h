@@ -15,25 +15,23 @@
 
 namespace kxtest {
 
+using arg = std::variant<long long, std::string>;
+
 // A copy of the thread's error record in plain values.
 struct error_record {
-    int id = 0;
-    int msg_num = 0;
+    int id = 0, msg_num = 0, set = 0;
     std::string catalogue;
-    int set = 0;
-    std::vector<std::variant<long long, std::string>> args;
+    std::vector<arg> args;
     std::string text; // the formatted message
 
     // Argument i (0-based) as an integer or a text.
     long long num(std::size_t i) const;
     std::string str(std::size_t i) const;
 };
-
 error_record last_error();
 
 // Whether the thread's record holds message msg_num with status and exactly
-// these arguments (numbers and texts).
-using arg = std::variant<long long, std::string>;
+// these arguments.
 testing::AssertionResult record_is(int status, int msg_num, const std::vector<arg> &args);
 
 // One record line of a trace file: "<s>.<9 digits> <tid> <component>
@@ -46,28 +44,27 @@ struct trace_line {
     std::vector<std::string> items;
 };
 std::optional<trace_line> parse_trace_line(const std::string &line);
+// Every record of a trace file; a line not of the record format fails the
+// test.
+std::vector<trace_line> read_trace_lines(const std::string &file);
 
 // The lines of a file; a last line without its newline is marked.
 std::vector<std::string> read_lines(const std::string &path);
 
-// Every record of a trace file; a line not of the record format fails the
-// test.
-std::vector<trace_line> read_trace_lines(const std::string &file);
+// Sets up tracing to a fresh file with the given levels; call before the
+// first library call of the test (each test runs in its own process).
+std::string start_tracing(const std::string &levels);
 
 // The records of the ACL library's component, with "-" items as empty texts.
 struct trace_record {
     unsigned id = 0;
     std::vector<std::string> items;
 };
-
-// Sets up tracing to a fresh file with the given levels; call before the
-// first library call of the test (each test runs in its own process).
-std::string start_tracing(const std::string &levels);
 std::vector<trace_record> read_trace(const std::string &file);
 std::vector<unsigned> trace_ids(const std::string &file);
 
-// The hex form of a value's bytes, as the trace file writes items (an
-// empty item is written "-": see trace_item).
+// The hex form of a value's bytes, as the trace file writes items; an
+// empty item is written "-" (trace_item).
 std::string hex_of(const void *p, std::size_t n);
 template <typename T> std::string hex_of(const T &v) {
     return hex_of(&v, sizeof v);
@@ -75,9 +72,8 @@ template <typename T> std::string hex_of(const T &v) {
 std::string hex_text(const std::string &s); // with its NUL
 std::string trace_item(const void *p, std::size_t n);
 
-// A fresh empty directory under the test temporary directory. Every
-// directory made so is removed, with its contents, when the process that
-// made it exits (each test runs in a process of its own).
+// A fresh empty directory under $TMPDIR, removed with its contents when
+// the process that made it exits (each test runs in a process of its own).
 std::string temp_dir();
 
 // Makes name, one of the locales that the build makes for the tests (see

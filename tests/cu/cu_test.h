@@ -10,22 +10,14 @@
 
 #include <kx_cu.h>
 
-#include "unique_mem.h"
-
 namespace cu_test {
 
-struct error_release {
-    void operator()(cu_error_t *err) const { cu_rel_error_1(err); }
+template <auto release> struct releaser {
+    template <typename T> void operator()(T *p) const { release(p); }
 };
-struct message_release {
-    void operator()(char *msg) const { cu_rel_errmsg_1(msg); }
-};
-struct iconv_close {
-    void operator()(cu_iconv_t h) const { cu_iconv_close_1(h); }
-};
-using unique_error = std::unique_ptr<cu_error_t, error_release>;
-using unique_message = std::unique_ptr<char, message_release>;
-using unique_iconv = std::unique_ptr<std::remove_pointer_t<cu_iconv_t>, iconv_close>;
+using unique_error = std::unique_ptr<cu_error_t, releaser<cu_rel_error_1>>;
+using unique_message = std::unique_ptr<char, releaser<cu_rel_errmsg_1>>;
+using unique_iconv = std::unique_ptr<std::remove_pointer_t<cu_iconv_t>, releaser<cu_iconv_close_1>>;
 
 // A copy of the calling thread's record.
 inline unique_error current_error() {
@@ -59,8 +51,8 @@ inline std::string describe(const cu_error_t *err) {
         return out.str() + (err->cu_arg_cnt == 0 ? " NULL" : " NULL with a count");
     for (kx_uint32_t i = 0; i < err->cu_arg_cnt; ++i) {
         const auto &v = err->cu_args[i].cu_arg_value;
-        const int kind = err->cu_args[i].cu_arg_type;
         out << (i == 0 ? " [" : " ");
+        const int kind = err->cu_args[i].cu_arg_type;
         if (kind == CU_ERROR_ARG_INT)
             out << 'i' << v.cu_arg_int;
         else if (kind == CU_ERROR_ARG_LONG)

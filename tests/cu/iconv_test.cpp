@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "cu_test.h"
+#include "unique_mem.h"
 
 namespace {
 
@@ -18,15 +19,8 @@ using cu_test::unique_iconv;
 
 const std::string nul(1, '\0');
 
-struct result {
-    int status;
-    std::string bytes; // the output, as counted by out_length
-    bool operator==(const result &) const = default;
-};
-
-void PrintTo(const result &r, std::ostream *out) {
-    *out << r.status << " " << ::testing::PrintToString(r.bytes);
-}
+// A status and the output, as counted by out_length.
+using result = std::pair<int, std::string>;
 
 // Converts bytes, NULs included. The outputs start as sentinels so that a
 // failure can be checked to leave them alone.
@@ -160,7 +154,7 @@ TEST(IconvTest, OneHandleServesManyThreads) {
             for (int i = 0; i < 500; ++i) {
                 const bool fail = (i + t) % 2 == 0;
                 const result r = convert(h.get(), fail ? bad : good + nul);
-                wrong[t] += fail ? r.status != CU_ICONV_BAD_SEQUENCE : r.bytes != want + nul;
+                wrong[t] += fail ? r.first != CU_ICONV_BAD_SEQUENCE : r.second != want + nul;
             }
         });
     }

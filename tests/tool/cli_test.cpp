@@ -106,33 +106,25 @@ TEST(CommandLine, TypeNamesAndLetters) {
         EXPECT_EQ(type_letter(name), letter) << name;
 }
 
-TEST(TemplateFile, ParsesCommentsBlanksAndHelpText) {
-    template_set set;
-    std::string error;
-    ASSERT_TRUE(parse_templates("# perms\n\n  r 0 read  Read the thing \n"
-                                "W 31 write\t\n",
-                                set, error))
-        << error;
-    ASSERT_EQ(set.perms.size(), 2u);
-    EXPECT_EQ(set.perms[0].printchar, 'r');
-    EXPECT_EQ(set.perms[0].code, 1u);
-    EXPECT_STREQ(set.perms[0].printstring, "read");
-    EXPECT_STREQ(set.perms[0].printhelp, "Read the thing");
-    EXPECT_EQ(set.perms[1].code, 0x80000000u);
-    EXPECT_STREQ(set.perms[1].printhelp, "");
-    sec_perm_set_t lib = set.get();
-    ASSERT_NE(lib, nullptr);
-    EXPECT_EQ(lib->count, 2);
-    EXPECT_EQ(lib->perms, set.perms.data());
-}
-
-TEST(TemplateFile, BadLinesAreNamedAndBoundsHeld) {
+// Comments and blank lines are skipped, help texts trimmed; a name of 13
+// bytes and a help text of 63 are the most a template holds.
+TEST(TemplateFile, ParsesTemplatesAndNamesBadLines) {
     const std::string name13(13, 'n'), help63(63, 'h');
     template_set set;
-    std::string error;
-    EXPECT_TRUE(parse_templates("x 1 " + name13 + " " + help63 + "\n", set, error)) << error;
-    EXPECT_EQ(std::strlen(set.perms[0].printstring), 13u);
-    EXPECT_EQ(std::strlen(set.perms[0].printhelp), 63u);
+    std::string error, shown;
+    ASSERT_TRUE(parse_templates("# perms\n\n  r 0 read  Read the thing \nW 31 write\t\nx 1 " +
+                                    name13 + " " + help63 + "\n",
+                                set, error))
+        << error;
+    for (const auto &p : set.perms)
+        shown += p.printchar + (" " + std::to_string(p.code)) + " " + p.printstring + " [" +
+                 p.printhelp + "]\n";
+    EXPECT_EQ(shown, "r 1 read [Read the thing]\nW 2147483648 write []\nx 2 " + name13 + " [" +
+                         help63 + "]\n");
+    sec_perm_set_t lib = set.get();
+    ASSERT_NE(lib, nullptr);
+    EXPECT_EQ(lib->count, 3);
+    EXPECT_EQ(lib->perms, set.perms.data());
 
     const std::pair<std::string, std::string> cases[] = {
         {"r 0\n", "line 1: expected CHAR BIT NAME [HELP]"},

@@ -21,15 +21,9 @@ using strings = std::vector<std::string>;
 
 namespace {
 
-constexpr const char *example_acl = "#ACL for the example resource\n"
-                                    "\n"
-                                    "N\n"
-                                    "o r\n"
-                                    "U UNIX root rwcx #administrator\n"
-                                    "u unix joe\n"
-                                    "g staff rw\n"
-                                    "g admin rwcxCqledvsao\n"
-                                    "e unix joe w\n";
+constexpr const char *example_acl = "#ACL for the example resource\n\nN\no r\n"
+                                    "U UNIX root rwcx #administrator\nu unix joe\n"
+                                    "g staff rw\ng admin rwcxCqledvsao\ne unix joe w\n";
 
 // A run and what it gives: output and error whole, or only their start
 // where the expectation ends in "...".
@@ -43,20 +37,18 @@ expected_run gives(strings args, int exit_code, std::string out, std::string err
     return {std::move(args), exit_code, std::move(out), std::move(err)};
 }
 
-void expect_text(const std::string &actual, const std::string &expected) {
-    if (expected.ends_with("..."))
-        EXPECT_EQ(actual.substr(0, expected.size() - 3), expected.substr(0, expected.size() - 3));
-    else
-        EXPECT_EQ(actual, expected);
-}
-
 void expect_runs(const std::vector<expected_run> &runs) {
     for (const auto &e : runs) {
         SCOPED_TRACE(testing::PrintToString(e.args));
         const auto r = run_kxacl(e.args);
         EXPECT_EQ(r.exit_code, e.exit_code) << r.err;
-        expect_text(r.out, e.out);
-        expect_text(r.err, e.err);
+        for (auto [actual, expected] : {std::pair{r.out, e.out}, {r.err, e.err}}) {
+            if (expected.ends_with("...")) {
+                expected.resize(expected.size() - 3);
+                actual.resize(std::min(actual.size(), expected.size()));
+            }
+            EXPECT_EQ(actual, expected);
+        }
     }
 }
 
@@ -114,8 +106,20 @@ TEST_F(KxaclTool, CompileWritesTheBufferAndTheCacheOrRefuses) {
     EXPECT_EQ(files(), (strings{"out.buf", "res.acl"}));
 }
 
-TEST_F(KxaclTool, CompileCacheSaysWhatBecameOfTheCachedFile) {
+// Editing never touches a cached file in place; compile --cache says what
+// became of it.
+TEST_F(KxaclTool, CachedFileIsNotEditedAndCompileSaysWhatBecameOfIt) {
     ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
+    const std::string cached = kxtest::read_file(cacl);
+    expect_runs({
+        gives({"del", cacl, "--anyother"}, 2, "",
+              "kxacl: refusing to write " + cacl +
+                  ": cached compiled files are written by the library only (use -o)\n"),
+        // Written elsewhere, the cached file stays as it was.
+        gives({"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"),
+        gives({"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"),
+    });
+    EXPECT_EQ(kxtest::read_file(cacl), cached);
     // An older-dated text replaces the one the cached file was compiled from.
     kxtest::write_file(acl, "o rwx\n");
     kxtest::shift_mtime(acl, -20);
@@ -197,11 +201,8 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
               "user krb5 root: no entry\n  no user entry of mechanism krb5\n"
               "anyother: r 0x00000001\n  decided by entry 6: o r\n"
               "unauthenticated: - 0x00000000\n  decided by entry 7: n\n"),
-        gives({"dump", acl}, 0,
-              "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n\tByte Ordering: 2\n"
-              "\tNumber of sub-ACLs: 5\n\tSubacl:\n"
-              "\t(length = 26 byte(s); type = 8; mech = unix; ACLE count = 1)\n\n"
-              "\t\ttype = e; mech = unix; id = joe; permission = w\n..."),
+        // The library's dump, whose lines its own tests check.
+        gives({"dump", acl}, 0, "ACL descriptor: 139 byte(s) long\n\tVersion: 1\n..."),
         gives({"dump", buf, "--json"}, 0,
               R"({"lines":["ACL descriptor: 139 byte(s) long","\tVersion: 1",)"
               R"("\tByte Ordering: 2","\tNumber of sub-ACLs: 5","\tSubacl:",)"
@@ -260,16 +261,6 @@ std::string flip_case(std::mt19937 &rng, std::string s) {
     return s;
 }
 
-strings check_args(const json &a) {
-    const std::string question = a["question"];
-    strings args{"--" + std::string(question == "groups" ? "group" : question)};
-    if (!a["mech"].is_null())
-        args.push_back(a["mech"]);
-    for (const auto &id : a["ids"])
-        args.push_back(id);
-    return args;
-}
-
 TEST_F(KxaclTool, ExplainAnswersAsCheckDoes) {
     std::mt19937 rng(17);
     int decided = 0, undecided = 0;
@@ -285,9 +276,12 @@ TEST_F(KxaclTool, ExplainAnswersAsCheckDoes) {
                        flip_case(rng, groups[rng() % 4]), flip_case(rng, groups[rng() % 4])}));
         ASSERT_EQ(j["answers"].size(), 7u) << j;
         for (const json &a : j["answers"]) {
-            strings args{"check", acl, "--json"};
-            for (const auto &arg : check_args(a))
-                args.push_back(arg);
+            const std::string question = a["question"];
+            strings args{"check", acl, "--json",
+                         question == "groups" ? "--group" : "--" + question};
+            if (!a["mech"].is_null())
+                args.push_back(a["mech"]);
+            args.insert(args.end(), a["ids"].begin(), a["ids"].end());
             const json c = parsed(run_kxacl(args));
             SCOPED_TRACE(made.text + a.dump());
             EXPECT_EQ(c["entry"], a["entry"]);
@@ -438,15 +432,9 @@ std::vector<std::string> lint_codes(const std::string &file) {
 
 TEST_F(KxaclTool, LintFindsEachPlantedEntryProblem) {
     kxtest::write_file(acl,
-                       "# planted problems\n"
-                       "n rx\n"
-                       "o rx\n"
-                       "u unix root rwcxCqledvsao\n"
-                       "u unix bob@fe80:0:0:0:0:0:0:1 rx\n"
-                       "u unx ann@h rx\n"
-                       "u unix carl@h r\n"
-                       "g admins rwcxCqledvsao\n"
-                       "e vgn2 svc@ rx\n",
+                       "# planted problems\nn rx\no rx\nu unix root rwcxCqledvsao\n"
+                       "u unix bob@fe80:0:0:0:0:0:0:1 rx\nu unx ann@h rx\nu unix carl@h r\n"
+                       "g admins rwcxCqledvsao\ne vgn2 svc@ rx\n",
                        0664);
     EXPECT_EQ(lint_codes(acl),
               (std::vector<std::string>{"KX105@2", "KX101@4", "KX102@5", "KX103@6", "KX104@7",
@@ -510,9 +498,8 @@ TEST_F(KxaclTool, LintFindsCacheStatesAndTheirFixes) {
 TEST_F(KxaclTool, LintIsSilentOnTheExampleFile) {
     kxtest::write_file(acl, kxtest::read_file(KXACL_EXAMPLE_ACL));
     kxtest::shift_mtime(acl, -10);
-    expect_runs({gives({"lint", acl}, 0, "")}); // without its cached file
-    ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    expect_runs({gives({"lint", acl}, 0, "")});
+    expect_runs({gives({"lint", acl}, 0, ""), // without its cached file
+                 gives({"compile", acl, "--cache"}, 0, "..."), gives({"lint", acl}, 0, "")});
 }
 
 TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWholeOrRefuse) {
@@ -546,20 +533,6 @@ TEST_F(KxaclTool, AddAndDelRewriteTheBufferFileWholeOrRefuse) {
     });
     EXPECT_EQ(kxtest::status_of(buf).st_mode & 07777, 0640u);
     EXPECT_EQ(files(), (strings{"res.acl", "res.buf"}));
-}
-
-TEST_F(KxaclTool, EditingNeverTouchesACachedFileInPlace) {
-    ASSERT_EQ(run_kxacl({"compile", acl, "--cache"}).exit_code, 0);
-    const std::string before = kxtest::read_file(cacl);
-    expect_runs({
-        gives({"del", cacl, "--anyother"}, 2, "",
-              "kxacl: refusing to write " + cacl +
-                  ": cached compiled files are written by the library only (use -o)\n"),
-        // Written elsewhere, the cached file stays as it was.
-        gives({"del", cacl, "--anyother", "-o", buf}, 0, "deleted: o\n"),
-        gives({"check", buf, "--anyother"}, 1, "no entry for the requester: nothing granted\n"),
-    });
-    EXPECT_EQ(kxtest::read_file(cacl), before);
 }
 
 // A FIFO, a device or a directory is neither read (a FIFO would hang the

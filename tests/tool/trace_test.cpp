@@ -168,7 +168,6 @@ std::set<point_key> decoded_points(const std::string &trace) {
 TEST(TraceDecode, EveryPointTheLibraryRecordsIsDecodedByName) {
     const std::string trace = kxtest::start_tracing("_SEL:API=8,Errors=1,Info=8,Perf=2");
     const std::string dir = kxtest::temp_dir();
-    const kxtest::removed_at_end cleanup{dir};
     call_every_function();
     read_along_every_path(dir);
     for (const char *category : {"API", "Info", "Perf"})
@@ -195,17 +194,14 @@ std::string record(unsigned id, const std::string &items, const char *component 
            (items.empty() ? "" : " " + items);
 }
 
-struct decode_case {
-    std::string line;
-    std::string shown; // after the time, or the whole raw line
-};
-
 TEST(TraceDecode, ItemsAreShownByTheirKind) {
     kxtool::perm_letters letters{};
     letters[0] = 'r';
     letters[1] = 'w';
     kxtool::trace_decoder decoder(false, {}, letters);
-    const decode_case cases[] = {
+    const struct {
+        std::string line, shown; // shown: after the local time
+    } cases[] = {
         {record(84, "24000000 03000080"),
          "17558 API sec__single_acle_perm:exit status=SEC_S_BAD_PERMISSION "
          "perm=0x80000003(rw+0x80000000)"},
@@ -275,9 +271,7 @@ TEST(TraceDecode, UnknownRecordsAreShownRawAndCounted) {
 }
 
 TEST(TraceDecode, JsonLinesCarryEveryField) {
-    const std::string dir = kxtest::temp_dir();
-    const kxtest::removed_at_end cleanup{dir};
-    const std::string trace = dir + "/trace";
+    const std::string trace = kxtest::temp_dir() + "/trace";
     kxtest::write_file(trace, record(84, "00000000 03000000") + "\n" + record(84, "") + "\n" +
                                   record(84, "00000000 03000000") + " torn");
     const auto r = run_kxacl({"trace", "--json", "--thread", "17558", trace});

@@ -139,18 +139,6 @@ TEST_F(Levels, UnreadablePartsAreWarnedAboutByName) {
                   prefix + "further mistakes not shown\n");
 }
 
-// The registry keeps its own copies of the names.
-TEST_F(Levels, RegistrationCopiesTheNames) {
-    char component[] = "_TST", api[] = "API";
-    const tr_category_description_t described[] = {{0, api, 1, 0}};
-    tr_detail_level_t level = 0xAA;
-    ASSERT_EQ(tr_register_component_1(component, &level, described, 1), TR_OK);
-    std::strcpy(component, "_XXX");
-    std::strcpy(api, "XYZ");
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "API", 4), TR_OK);
-    EXPECT_EQ(level, 4);
-}
-
 // Clients read levels without locks while they change; ThreadSanitizer
 // checks that the library's stores are atomic.
 TEST_F(Levels, ReadersSeeOnlyWholeLevelsWhileTheyChange) {
@@ -175,22 +163,10 @@ TEST_F(Levels, ReadersSeeOnlyWholeLevelsWhileTheyChange) {
     EXPECT_EQ(odd_reads, 0);
 }
 
-TEST_F(Levels, RegisterUnregisterAndRegisterAgain) {
-    levels_t second = untouched;
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
-    EXPECT_EQ(register_as("_TST", second), TR_ALREADY_REGISTERED);
-    EXPECT_EQ(second, untouched);
-    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_OK);
-    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_NOT_REGISTERED);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "*", 7), TR_NOT_REGISTERED);
-    EXPECT_EQ(levels, defaults); // no longer written
-    setenv("KX_TRACE_LEVELS", "_TST:Errors=5", 1);
-    ASSERT_EQ(register_as("_TST", second), TR_OK);
-    EXPECT_EQ(second, (levels_t{5, 1, 3, 9, 4}));
-    EXPECT_EQ(tr_unregister_component_1(nullptr), TR_BAD_ARGUMENT);
-}
-
-TEST_F(Levels, BadRegistrationsAreRefusedWithoutEffect) {
+// Bad registrations are refused without effect, keeping errno; the
+// registry keeps its own copies of the names; once unregistered, a
+// component's levels are no longer written and its name is free again.
+TEST_F(Levels, RegistrationRules) {
     const tr_category_description_t id_too_big[] = {{0, "A", 1, 0}, {2, "B", 1, 0}};
     const tr_category_description_t no_name[] = {{0, nullptr, 1, 0}};
     tr_detail_level_t *into = levels.data();
@@ -205,6 +181,26 @@ TEST_F(Levels, BadRegistrationsAreRefusedWithoutEffect) {
     EXPECT_EQ(errno, 4242);
     EXPECT_EQ(levels, untouched);
     EXPECT_EQ(tr_set_detail_level_1("_TST", "*", 1), TR_NOT_REGISTERED);
+    EXPECT_EQ(tr_unregister_component_1(nullptr), TR_BAD_ARGUMENT);
+
+    levels_t second = untouched;
+    char component[] = "_TST", api[] = "API";
+    ASSERT_EQ(register_as(component, levels), TR_OK);
+    EXPECT_EQ(register_as("_TST", second), TR_ALREADY_REGISTERED);
+    EXPECT_EQ(second, untouched);
+    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_OK);
+    EXPECT_EQ(tr_unregister_component_1("_TST"), TR_NOT_REGISTERED);
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "*", 7), TR_NOT_REGISTERED);
+    EXPECT_EQ(levels, defaults); // no longer written
+    setenv("KX_TRACE_LEVELS", "_TST:API=5", 1);
+    const tr_category_description_t described[] = {{0, api, 1, 0}};
+    tr_detail_level_t level = 0xAA;
+    ASSERT_EQ(tr_register_component_1(component, &level, described, 1), TR_OK);
+    EXPECT_EQ(level, 5);
+    std::strcpy(component, "_XXX");
+    std::strcpy(api, "XYZ");
+    EXPECT_EQ(tr_set_detail_level_1("_TST", "API", 4), TR_OK);
+    EXPECT_EQ(level, 4);
 }
 
 } // namespace

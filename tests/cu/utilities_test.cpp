@@ -1,0 +1,211 @@
+// POSIX-locale case handling, address texts and the time base.
+#include <gtest/gtest.h>
+
+#include <sys/socket.h>
+#include <time.h>
+
+#include <cstdint>
+#include <random>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <kx_cu.h>
+
+#include "posix_case.h"
+
+namespace {
+
+int sign(long v) {
+    return (v > 0) - (v < 0);
+}
+
+// Only A..Z fold; bytes compare unsigned.
+TEST(PosixCaseTest, FoldsOnlyAsciiCapitalsAndComparesBytesUnsigned) {
+    for (int c = -1; c <= 255; ++c)
+        EXPECT_EQ(cu_tolower_posix_1(c), c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : c) << c;
+    // Exactly sized heap texts, so that a read past a NUL is caught.
+    const std::vector<char> ab = {'a', 'b', 0}, AB = {'A', 'B', 0}, a = {'a', 0};
+    const struct {
+        const char *s1, *s2;
+        size_t n; // 0: cu_strcasecmp_posix_1
+        int sign;
+    } cases[] = {
+        {"ReadWrite", "rEADwRITE", 0, 0},
+        {"AZaz09_@[`{", "azAZ09_@[`{", 0, 0},
+        {"\xC3\x89", "\xC3\xA9", 0, -1}, // "É" and "é" in UTF-8,
+        {"\xC9", "\xE9", 0, -1},         // and in Latin-1
+        {"[", "A", 0, -1},               // '[' (5B) sorts before 'a' (61)
+        {"A", "[", 0, 1},
+        {"\x80", "z", 0, 1}, // bytes above 7F sort last
+        {"abc", "ABCD", 0, -1},
+        {"ABCD", "abc", 0, 1},
+        {nullptr, "", 0, -1}, // NULL sorts first
+        {nullptr, nullptr, 0, 0},
+        {"abcX", "ABCy", 3, 0},
+        {"abcX", "ABCy", 4, -1},
+        {"[", "A", 1, -1},
+        {nullptr, "a", 1, -1},
+        {ab.data(), AB.data(), 1000, 0},
+        {ab.data(), a.data(), 1000, 1},
+    };
+    for (const auto &c : cases) {
+        const int result =
+            c.n == 0 ? cu_strcasecmp_posix_1(c.s1, c.s2) : cu_strncasecmp_posix_1(c.s1, c.s2, c.n);
+        EXPECT_EQ(sign(result), c.sign) << (c.s1 ? c.s1 : "NULL") << " | " << c.s2 << " " << c.n;
+    }
+    EXPECT_EQ(cu_strncasecmp_posix_1("x", "y", 0), 0);
+}
+
+// The word-at-a-time comparisons of posix_case.h agree with the exported
+// one over texts that share prefixes of every length around the word size
+// and differ in case, in one byte or in length, over bytes at the edges of
+// the folding range. Each text is followed by its NUL and random bytes that
+// do not count, in a block of exactly that size.
+TEST(PosixCaseWords, AgreeWithTheExportedComparison) {
+    namespace pc = kx::posix_case;
+    std::mt19937 random{7};
+    const std::string edges("@AZ[`az{09~\x7f\x80\xc0\xda\xfa\xff\x01", 18);
+    auto text = [&](std::size_t length) {
+        std::string t;
+        while (t.size() < length)
+            t += edges[random() % edges.size()];
+        return t;
+    };
+    auto with_tail = [&](const std::string &t) {
+        std::vector<char> v(t.c_str(), t.c_str() + t.size() + 1);
+        for (std::size_t n = random() % 12; n > 0; --n)
+            v.push_back(static_cast<char>(random()));
+        return v;
+    };
+    for (int n = 0; n < 20000; ++n) {
+        const std::string a = text(random() % 20);
+        std::string b = a;
+        if (const auto how = random() % 4; how == 0) { // another case
+            for (char &c : b)
+                c = static_cast<char>(c >= 'a' && c <= 'z' ? c - 32 : c);
+        } else if (how == 1 && !b.empty()) { // one byte changed
+            b[random() % b.size()] = edges[random() % edges.size()];
+        } else if (how == 2) { // cut short
+            b.resize(random() % (b.size() + 1));
+        } else if (how == 3) {
+            b += text(random() % 10);
+        }
+        const int expected = cu_strcasecmp_posix_1(a.c_str(), b.c_str());
+        const auto ta = with_tail(a), tb = with_tail(b);
+        const std::size_t sa = a.size() + 1, sb = b.size() + 1;
+        SCOPED_TRACE(a + " | " + b);
+        ASSERT_EQ(pc::compare(ta.data(), ta.size(), tb.data(), tb.size()), expected);
+        ASSERT_EQ(sign(pc::prepared_text(a.c_str(), sa).order(tb.data(), tb.size())),
+                  sign(expected));
+        if (expected == 0) {
+            ASSERT_EQ(pc::folded_hash(a.c_str(), sa), pc::folded_hash(b.c_str(), sb));
+        }
+        // Keys that differ order the texts; equal keys of a text that ends
+        // within them mean equal texts.
+        const std::uint64_t ka = pc::sort_key(a.c_str(), sa), kb = pc::sort_key(b.c_str(), sb);
+        if (ka != kb) {
+            ASSERT_EQ(ka < kb ? -1 : 1, sign(expected));
+        } else if (sa <= 8 || sb <= 8) {
+            ASSERT_EQ(expected, 0);
+        }
+    }
+}
+
+// The address whose eight 16-bit groups are given.
+std::vector<unsigned char> v6(std::vector<unsigned> groups) {
+    std::vector<unsigned char> b;
+    for (unsigned g : groups)
+        b.insert(b.end(), {static_cast<unsigned char>(g >> 8), static_cast<unsigned char>(g)});
+    return b;
+}
+
+// Dotted quads and the one canonical text of each IPv6 address; every
+// smaller buffer fails untouched, and exactly sized heap buffers make an
+// overrun visible.
+TEST(IpaddrTest, TextIsCanonical) {
+    const struct {
+        int af;
+        std::vector<unsigned char> addr;
+        std::string text;
+    } cases[] = {
+        {AF_INET, {127, 0, 0, 1}, "127.0.0.1"},
+        {AF_INET, {10, 0, 99, 200}, "10.0.99.200"},
+        {AF_INET, {192, 168, 100, 255}, "192.168.100.255"},
+        {AF_INET6, v6({0x2001, 0xdb8, 0, 0, 0, 0, 0, 1}), "2001:db8::1"},
+        {AF_INET6, v6({0x2001, 0xdb8, 0, 1, 1, 1, 1, 1}), "2001:db8:0:1:1:1:1:1"}, // one zero stays
+        {AF_INET6, v6({0x2001, 0, 0, 1, 0, 0, 0, 1}), "2001:0:0:1::1"},         // the longest run
+        {AF_INET6, v6({0x2001, 0xdb8, 0, 0, 1, 0, 0, 1}), "2001:db8::1:0:0:1"}, // the first
+        {AF_INET6, v6({0, 0, 0, 0, 0, 0, 0, 0}), "::"},
+        {AF_INET6, v6({0, 0, 0, 0, 0, 0, 0, 1}), "::1"},
+        {AF_INET6, v6({1, 0, 0, 0, 0, 0, 0, 0}), "1::"},
+        {AF_INET6, v6({0x2001, 0xdb8, 0xa, 0xbc, 0xdef, 0x1234, 0, 0xABCD}),
+         "2001:db8:a:bc:def:1234:0:abcd"},
+        {AF_INET6, std::vector<unsigned char>(16, 0xff), "ffff:ffff:ffff:ffff:ffff:ffff:ffff:ffff"},
+        {AF_INET6, v6({0, 0, 0, 0, 0, 0xffff, 0xc000, 0x0201}), "::ffff:192.0.2.1"},
+        {AF_INET6, v6({0, 0, 0, 0, 0, 0xffff, 0xffff, 0xffff}), "::ffff:255.255.255.255"},
+        {AF_INET6, v6({0, 0, 0, 0, 0, 0, 0xc000, 0x0201}), "::c000:201"}, // not IPv4-mapped
+        {AF_INET6, v6({0, 0, 0, 0, 1, 0xffff, 0xc000, 0x0201}), "::1:ffff:c000:201"},
+    };
+    for (const auto &c : cases) {
+        for (size_t size = 0; size <= c.text.size(); ++size) {
+            std::vector<char> buf(size + 1, '#');
+            EXPECT_EQ(cu_ipaddr_ntop_1(c.af, c.addr.data(), buf.data(), size), -1) << size;
+            EXPECT_EQ(std::string(buf.begin(), buf.end()), std::string(size + 1, '#'));
+        }
+        std::vector<char> exact(c.text.size() + 1);
+        ASSERT_EQ(cu_ipaddr_ntop_1(c.af, c.addr.data(), exact.data(), exact.size()), 0) << c.text;
+        EXPECT_EQ(std::string(exact.data()), c.text);
+    }
+    const unsigned char v4[4] = {1, 2, 3, 4};
+    char buf[CU_IPADDR_TEXT_MAX] = "untouched";
+    EXPECT_EQ(cu_ipaddr_ntop_1(AF_UNIX, v4, buf, sizeof buf), -1);
+    EXPECT_EQ(cu_ipaddr_ntop_1(AF_INET, nullptr, buf, sizeof buf), -1);
+    EXPECT_EQ(cu_ipaddr_ntop_1(AF_INET, v4, nullptr, sizeof buf), -1);
+    EXPECT_STREQ(buf, "untouched");
+}
+
+using seconds_nanos = std::pair<kx_int64_t, kx_int64_t>;
+
+TEST(TimebaseTest, CounterIsTheMonotonicClockInNanosecondsAndConverts) {
+    cu_timeinfo_t info = {7, 7};
+    cu_get_procspeed_1(&info);
+    EXPECT_EQ(info.timeinfo1, 1000000000u);
+    EXPECT_EQ(info.timeinfo2, 0u);
+    auto monotonic_ns = [] {
+        timespec ts{};
+        clock_gettime(CLOCK_MONOTONIC, &ts);
+        return static_cast<kx_uint64_t>(ts.tv_sec) * 1000000000u +
+               static_cast<kx_uint64_t>(ts.tv_nsec);
+    };
+    const kx_uint64_t before = monotonic_ns(), counter = cu_get_ctr_1();
+    EXPECT_LE(before, counter);
+    EXPECT_LE(counter, monotonic_ns());
+
+    const kx_uint64_t fast = kx_uint64_t{1} << 63; // remainder * 1e9 would wrap 64 bits
+    const struct {
+        kx_uint64_t counter, ticks_per_second;
+        seconds_nanos expected;
+    } cases[] = {
+        {1500000000u, 1000000000u, {1, 500000000}},
+        {10, 3, {3, 333333333}},
+        {UINT64_MAX, 1000000000u, {18446744073, 709551615}},
+        {fast + fast / 2, fast, {1, 500000000}},
+        {UINT64_MAX, 1, {INT64_MAX, 0}}, // clamped
+        {123456789, 0, {0, 0}},          // no time base
+    };
+    for (const auto &c : cases) {
+        info = {c.ticks_per_second, 0};
+        seconds_nanos got{-1, -1};
+        cu_cvt_time_1(c.counter, &info, &got.first, &got.second);
+        EXPECT_EQ(got, c.expected) << c.counter << "/" << c.ticks_per_second;
+    }
+    seconds_nanos got{-1, -1};
+    cu_cvt_time_1(123456789, nullptr, &got.first, &got.second);
+    EXPECT_EQ(got, seconds_nanos(0, 0));
+    info = {1000, 0};
+    cu_cvt_time_1(2500, &info, &got.first, nullptr);
+    EXPECT_EQ(got.first, 2);
+}
+
+} // namespace
