@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
+#include <functional>
 #include <string>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -16,6 +17,7 @@
 #include <gtest/gtest.h>
 
 #include "acl_fixtures.h"
+#include "syscalls.h"
 
 namespace kxtest {
 
@@ -156,6 +158,13 @@ struct acl_dir {
         shift_mtime(acl, -10);
     }
 };
+
+// Runs flip just before the reader's system call of kind numbered nth
+// (counted from now): a name given to another file between its steps.
+inline void flip_before(kxacl::sys_call kind, long nth, std::function<void()> *flip) {
+    kxacl::sys_before_nth(
+        kind, nth, [](void *f) { (*static_cast<std::function<void()> *>(f))(); }, flip);
+}
 
 // A user made for one test with useradd, removed again with userdel.
 class scoped_user {
