@@ -166,6 +166,12 @@ inline void flip_before(kxacl::sys_call kind, long nth, std::function<void()> *f
         kind, nth, [](void *f) { (*static_cast<std::function<void()> *>(f))(); }, flip);
 }
 
+// The ACL compiled from text.
+inline std::string compiled(const std::string &text) {
+    acl_dir d(text);
+    return acl_read(d.acl, SEC_F_ACL_TEXT).bytes();
+}
+
 // A user made for one test with useradd, removed again with userdel.
 class scoped_user {
   public:

@@ -28,11 +28,6 @@ using items = std::vector<std::string>;
 
 namespace {
 
-std::string compiled(const std::string &text) {
-    acl_dir d(text);
-    return acl_read(d.acl, TEXT).bytes();
-}
-
 std::string hex(const std::string &s) {
     return hex_of(s.data(), s.size());
 }
