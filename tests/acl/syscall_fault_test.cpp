@@ -26,8 +26,7 @@ constexpr int injected = EIO;
 // status, message and arguments ("$" starts the directory), or success
 // with these rflags.
 struct outcome {
-    kx_int32_t status;
-    int msg;
+    kx_int32_t status, msg;
     kx_uint32_t rflags;
     std::vector<arg> args;
 };
@@ -38,11 +37,19 @@ outcome gives(kx_uint32_t rflags) {
     return {SEC_S_OK, 0, rflags, {}};
 }
 
-// The outcome of each call of a kind, in the order the calls are made; a
-// kind not listed must not be called at all.
-using fault_rows = std::map<sys_call, std::vector<outcome>>;
-
 enum class cacl_before { absent, stale, current };
+
+// One way through the reader: the CACL file it starts from, its flags, a
+// name relative to the working directory or not, and the outcome of each
+// call of each kind in the order made (a kind not listed is not called).
+using fault_rows = std::map<sys_call, std::vector<outcome>>;
+struct read_path {
+    const char *what;
+    cacl_before cacl;
+    kx_uint32_t flags;
+    bool relative;
+    fault_rows calls;
+};
 
 const char *const kind_names[] = {"open",   "read",   "write",  "close",  "stat",
                                   "lstat",  "fstat",  "fchown", "fchmod", "rename",
@@ -110,28 +117,25 @@ bool read_failing(const prepared &p, const std::string &name, kx_uint32_t flags,
 
 // Fails every call of every kind once, on files prepared afresh each time;
 // the number of calls of each kind must be the number of outcomes listed.
-// With relative, the name is given relative to the working directory.
-void fail_each_call(const std::string &path, cacl_before cacl, kx_uint32_t flags, bool relative,
-                    const fault_rows &rows) {
+void fail_each_call(const read_path &path) {
     for (int k = 0; k <= static_cast<int>(sys_call::fcntl); ++k) {
-        const auto kind = static_cast<sys_call>(k);
-        auto row = rows.find(kind);
-        std::size_t listed = row == rows.end() ? 0 : row->second.size();
-        std::size_t n = 0;
+        auto row = path.calls.find(static_cast<sys_call>(k));
+        std::size_t listed = row == path.calls.end() ? 0 : row->second.size(), n = 0;
         for (;; ++n) {
-            SCOPED_TRACE(path + ": " + kind_names[k] + " number " + std::to_string(n));
-            prepared p(cacl);
+            SCOPED_TRACE(path.what + std::string(": ") + kind_names[k] + " " + std::to_string(n));
+            prepared p(path.cacl);
             // A relative name joins the working directory as getcwd gives it.
             std::string dir = p.d.dir;
-            if (relative) {
+            if (path.relative) {
                 EXPECT_EQ(chdir(dir.c_str()), 0);
                 dir = std::filesystem::canonical(dir).string();
             }
-            if (!read_failing(p, relative ? "acl" : p.d.acl, flags, kind, static_cast<long>(n),
-                              injected, n < listed ? &row->second[n] : nullptr, dir))
+            if (!read_failing(p, path.relative ? "acl" : p.d.acl, path.flags,
+                              static_cast<sys_call>(k), static_cast<long>(n), injected,
+                              n < listed ? &row->second[n] : nullptr, dir))
                 break;
         }
-        EXPECT_EQ(n, listed) << path << ": calls of " << kind_names[k];
+        EXPECT_EQ(n, listed) << path.what << ": calls of " << kind_names[k];
     }
 }
 
@@ -150,50 +154,39 @@ const outcome no_file = fails(SEC_S_NO_ACL_FILE, MSG_2650_135, {"$/acl", injecte
 // descriptor, before reading it. close: the temporary file, the writer's
 // CACL descriptor, the text (the last two change nothing). Whatever fails
 // in the writer, the read succeeds uncached.
+// clang-format off
 const fault_rows compile_and_cache = {
-    {sys_call::stat, {no_file, text_only}},
-    {sys_call::lstat, {text_only, text_cached}},
+    {sys_call::stat, {no_file, text_only}}, {sys_call::lstat, {text_only, text_cached}},
     {sys_call::open, {text_cached, unopened, text_only, text_only}},
-    {sys_call::fstat, {unreadable}},
-    {sys_call::fcntl, {short_read}},
-    {sys_call::read, {short_read}},
-    {sys_call::write, {text_only}},
-    {sys_call::close, {text_only, text_cached, text_cached}},
-    {sys_call::fchown, {text_only}},
-    {sys_call::fchmod, {text_only}},
-    {sys_call::rename, {text_only}}};
+    {sys_call::fstat, {unreadable}}, {sys_call::fcntl, {short_read}}, {sys_call::read, {short_read}},
+    {sys_call::write, {text_only}}, {sys_call::close, {text_only, text_cached, text_cached}},
+    {sys_call::fchown, {text_only}}, {sys_call::fchmod, {text_only}}, {sys_call::rename, {text_only}}};
+// clang-format on
 
 // A stale CACL file is opened and judged by its descriptor first: a failed
-// fstat only means compiling, and its descriptor is closed again.
-TEST(SyscallFailure, CompilingAndCaching) {
-    fail_each_call("no CACL file", cacl_before::absent, CACHE, false, compile_and_cache);
+// fstat only means compiling, and its descriptor is closed again. Any
+// failure on the way to a current CACL file falls back to the text, which
+// compiles to the same bytes; the CACL file, being newer, stays.
+TEST(SyscallFailure, EachCallOnEachPath) {
     fault_rows stale = compile_and_cache;
     stale[sys_call::fstat].insert(stale[sys_call::fstat].begin(), text_cached);
     stale[sys_call::close].insert(stale[sys_call::close].begin(), text_cached);
-    fail_each_call("stale CACL file", cacl_before::stale, CACHE, false, stale);
-}
-
-// Any failure on the way to a current CACL file falls back to the text,
-// which compiles to the same bytes; the CACL file, being newer, stays.
-TEST(SyscallFailure, ReadingTheCaclFile) {
-    fail_each_call("current CACL file", cacl_before::current, CACHE | CONVERT, false,
-                   {{sys_call::stat, {no_file}},
-                    {sys_call::open, {text_only}},
-                    {sys_call::fstat, {text_only}},
-                    {sys_call::read, {text_only}},
-                    {sys_call::close, {gives(CONVERT)}}});
-}
-
-TEST(SyscallFailure, CompilingARelativeName) {
-    fail_each_call(
-        "relative name", cacl_before::absent, TEXT, true,
-        {{sys_call::getcwd, {fails(SEC_S_NO_ACL_FILE, MSG_2650_166, {"getcwd()", injected})}},
-         {sys_call::stat, {no_file}},
-         {sys_call::open, {unopened}},
-         {sys_call::fstat, {unreadable}},
-         {sys_call::fcntl, {short_read}},
-         {sys_call::read, {short_read}},
-         {sys_call::close, {text_only}}});
+    // clang-format off
+    const read_path paths[] = {
+        {"no CACL file", cacl_before::absent, CACHE, false, compile_and_cache},
+        {"stale CACL file", cacl_before::stale, CACHE, false, stale},
+        {"current CACL file", cacl_before::current, CACHE | CONVERT, false,
+         {{sys_call::stat, {no_file}}, {sys_call::open, {text_only}}, {sys_call::fstat, {text_only}},
+          {sys_call::read, {text_only}}, {sys_call::close, {gives(CONVERT)}}}},
+        {"relative name, compiled", cacl_before::absent, TEXT, true,
+         {{sys_call::getcwd, {fails(SEC_S_NO_ACL_FILE, MSG_2650_166, {"getcwd()", injected})}},
+          {sys_call::stat, {no_file}}, {sys_call::open, {unopened}}, {sys_call::fstat, {unreadable}},
+          {sys_call::fcntl, {short_read}}, {sys_call::read, {short_read}},
+          {sys_call::close, {text_only}}}},
+    };
+    // clang-format on
+    for (const read_path &path : paths)
+        fail_each_call(path);
 }
 
 // A read or a write that moves half the bytes: the read fails showing the
