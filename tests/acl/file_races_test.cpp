@@ -9,6 +9,7 @@
 #include <functional>
 #include <string>
 #include <sys/wait.h>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -25,14 +26,7 @@ using namespace std::string_literals;
 namespace {
 
 // What a text comes to: the status, the message (with its line) and the bytes.
-struct compiled_text {
-    kx_int32_t status;
-    std::string message, bytes;
-    bool operator==(const compiled_text &) const = default;
-};
-void PrintTo(const compiled_text &c, std::ostream *os) {
-    *os << c.status << " " << c.message << " " << hex_of(c.bytes.data(), c.bytes.size());
-}
+using compiled_text = std::tuple<kx_int32_t, std::string, std::string>;
 
 // Compiles the whole text held in memory, line by line: the reference for
 // the same text read from a file.
@@ -40,20 +34,19 @@ compiled_text compile_in_memory(std::string text) {
     text.push_back('\0');
     char *cursor = text.data();
     std::size_t remaining = text.size();
-    int lineno = 1, count = 0;
-    sec_acltree_t *trees = nullptr;
+    int lineno = 1;
+    owned_trees trees;
+    owned_acl acl;
     kx_int32_t rc;
     sec_acle_desc entry{};
     while ((rc = sec__read_acle_from_text(nullptr, &cursor, &remaining, &lineno, &entry)) == 1)
-        if (entry.type != 0 && (rc = sec__add_acle_to_trees(&entry, &trees, &count)) != SEC_S_OK)
+        if (entry.type != 0 &&
+            (rc = sec__add_acle_to_trees(&entry, &trees.trees, &trees.count)) != SEC_S_OK)
             break;
-    sec_buffer_s acl{0, nullptr};
-    if (rc == 0 && count > 0)
-        rc = sec__acltrees_to_acl(trees, count, &acl);
-    free_acltrees(trees, count);
-    unique_mem<char> owned(static_cast<char *>(acl.value));
-    return {rc, rc == 0 ? "" : last_error().text,
-            std::string(owned.get(), static_cast<std::size_t>(acl.length))};
+    if (rc == 0 && trees.count > 0)
+        rc = sec__acltrees_to_acl(trees.trees, trees.count, acl.get());
+    bytes b = acl.contents();
+    return {rc, rc == 0 ? "" : last_error().text, std::string(b.begin(), b.end())};
 }
 
 compiled_text compile_file(const std::string &text) {
@@ -99,7 +92,7 @@ TEST(ReadAclFileText, AnyTextReadsAsItCompilesInMemory) {
                      text.substr(text.size() - std::min<std::size_t>(text.size(), 20)));
         EXPECT_EQ(compile_file(text), compile_in_memory(text));
     }
-    EXPECT_NE(compile_file(texts[1]).bytes, compile_file(users(4000)).bytes);
+    EXPECT_NE(std::get<2>(compile_file(texts[1])), std::get<2>(compile_file(users(4000))));
 }
 
 // A text cut short between two reads of the window: the report, and the

@@ -19,8 +19,8 @@ namespace {
 const char text_a[] = "u unix bob rw\ng staff r\no r\n";
 const char text_b[] = "u unix bob rcx\ng staff w\ng wheel r\n";
 
-// Runs reader(i) for i up to reads on each of three threads, and work()
-// on a fourth; returns the readers' first failure, empty when none failed.
+// Runs reader(i) for i up to reads on three threads, and work() on a
+// fourth; the readers' first failure, or "".
 template <typename Reader, typename Work>
 std::string run_threads(int reads, Reader reader, Work work, std::atomic<bool> &readers_done) {
     std::atomic<int> failures{0}, left{3};
@@ -41,11 +41,10 @@ std::string run_threads(int reads, Reader reader, Work work, std::atomic<bool> &
 }
 
 // Readers see one whole version while the file is replaced by renaming a
-// complete file over it, as editors do; B is dated ahead of any CACL file
-// written meanwhile, so that readers compile and cache it, A behind, so
-// that they take the CACL file of either. A reader that finds the file
-// replaced on every retry gives up (2650-139, nothing read): an answer
-// that a slow scheduler brings about, not a fault.
+// complete file over it, as editors do; B is dated ahead of any CACL file,
+// so that readers compile and cache it, A behind, so that they take the
+// CACL file of either. Finding the file replaced on every retry gives up
+// (2650-139, nothing read): a slow scheduler's doing, not a fault.
 TEST(ReadAclFileThreads, ReadersSeeOneWholeVersionWhileTheFileIsReplaced) {
     const std::string acl_a = compiled(text_a), acl_b = compiled(text_b);
     acl_dir d(text_a);
@@ -76,11 +75,10 @@ TEST(ReadAclFileThreads, ReadersSeeOneWholeVersionWhileTheFileIsReplaced) {
         EXPECT_TRUE(name == "acl" || name == "acl.cacl") << name;
 }
 
-// A local user's race against readers that cache: the ACL file's name, a
-// symbolic link in the user's directory, flips between root's ACL file and
-// the user's own. Every CACL file that a reader leaves must hold the bytes
-// compiled from the file whose owner it carries; it is removed after the
-// check so that more get written.
+// The ACL file's name, a symbolic link in a user's directory, flips between
+// root's ACL file and the user's own while readers cache: every CACL file
+// left holds the bytes of the file whose owner it carries (and is removed,
+// so that more get written).
 TEST(ReadAclFileThreads, CacheOfAFlippedNameHoldsTheBytesOfTheFileWhoseOwnerItCarries) {
     KXTEST_REQUIRE_ROOT();
     const std::string acl_a = compiled(text_a), acl_b = compiled(text_b);
