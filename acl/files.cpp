@@ -1,5 +1,5 @@
-// Locating an ACL file, looking up the user who owns it, and reading a
-// whole open file into memory.
+// Locating an ACL file, looking up the user who owns it, and reading an
+// open file into memory.
 #include "files.h"
 
 #include <algorithm>
@@ -125,23 +125,6 @@ kx_int32_t read_sized(const char *aclfname, int aclfdes, std::uint64_t size, cha
     return SEC_S_OK;
 }
 
-kx_int32_t read_into_buffer(const char *aclfname, int aclfdes, char **aclfbuf,
-                            std::size_t *aclfsize) {
-    struct stat by_name, opened;
-    if (sys_stat(aclfname, &by_name) != 0)
-        return report_unexaminable(aclfname, errno);
-    if (sys_fstat(aclfdes, &opened) != 0)
-        return report_unexaminable(aclfname, errno);
-    auto size = static_cast<std::uint64_t>(by_name.st_size);
-    // The size comes from the name, the bytes from the descriptor: when the
-    // name has meanwhile been given to another file (a replacing rename),
-    // the two belong to different files, and the read counts as short
-    // rather than mixing an old file with a new size.
-    if (!same_inode(by_name, opened))
-        return report_short_read(aclfname, size, 0, 0);
-    return read_sized(aclfname, aclfdes, size, aclfbuf, aclfsize);
-}
-
 // The window of a text_reader: large enough for many lines per read, and
 // always for more than the longest line, so that a window full of one
 // line proves that line too long.
@@ -209,13 +192,6 @@ kx_int32_t read_known_size(const char *aclfname, int aclfdes, std::uint64_t size
     *aclfbuf = nullptr;
     *aclfsize = 0;
     return timed_read([&] { return read_sized(aclfname, aclfdes, size, aclfbuf, aclfsize); });
-}
-
-kx_int32_t acl__read_acl_file(const char *aclfname, int aclfdes, char **aclfbuf,
-                              std::size_t *aclfsize) {
-    *aclfbuf = nullptr;
-    *aclfsize = 0;
-    return timed_read([&] { return read_into_buffer(aclfname, aclfdes, aclfbuf, aclfsize); });
 }
 
 text_reader::text_reader(const char *aclfname, int aclfdes, std::uint64_t size)

@@ -1,5 +1,5 @@
-// Locating an ACL file, looking up the user who owns it, and reading a
-// whole open file into memory.
+// Locating an ACL file, looking up the user who owns it, and reading an
+// open file into memory.
 #ifndef KXACL_FILES_H
 #define KXACL_FILES_H
 
@@ -47,15 +47,11 @@ kx_int32_t report_unexaminable(const char *aclfname, int err);
 // size bytes were read; err is the read's system error number.
 kx_int32_t report_short_read(const char *aclfname, std::uint64_t size, std::int64_t got, int err);
 
-// Reads the whole file aclfname, open for reading at offset 0 as aclfdes,
-// into a new zero-filled buffer of its size plus 1 (freed with free). A file
-// of size 0 gives no buffer. On failure *aclfbuf is null and *aclfsize 0.
-kx_int32_t acl__read_acl_file(const char *aclfname, int aclfdes, char **aclfbuf,
-                              std::size_t *aclfsize);
-
-// The reading part of acl__read_acl_file for a file whose size is known
-// from a status already taken: size bytes from aclfdes into a new buffer of
-// size + 1 bytes ending in NUL; no buffer for size 0.
+// Reads size bytes, the size of the open file aclfdes from a status already
+// taken, in one read into a new buffer of size + 1 bytes ending in NUL
+// (freed with free); a short count is not retried and fails with 2650-139.
+// A file of size 0 gives no buffer. On failure *aclfbuf is null and
+// *aclfsize 0.
 kx_int32_t read_known_size(const char *aclfname, int aclfdes, std::uint64_t size, char **aclfbuf,
                            std::size_t *aclfsize);
 
@@ -73,7 +69,7 @@ struct text_run {
 // Reads the text of an open file of size bytes through a fixed window, so
 // that compiling it costs memory in proportion to its entries, not to its
 // size. Each read asks for what the window can take; a short count is not
-// retried and fails as for acl__read_acl_file (2650-139). Reading stops at
+// retried and fails with 2650-139. Reading stops at
 // the first NUL byte: the text ends there.
 class text_reader {
   public:

@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
+#include <functional>
 #include <string>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -16,6 +17,7 @@
 #include <gtest/gtest.h>
 
 #include "acl_fixtures.h"
+#include "syscalls.h"
 
 namespace kxtest {
 
@@ -37,11 +39,6 @@ inline std::string read_file(const std::string &path) {
         bytes.append(chunk, static_cast<std::size_t>(n));
     close(fd);
     return bytes;
-}
-
-inline bool exists(const std::string &path) {
-    struct stat st;
-    return lstat(path.c_str(), &st) == 0;
 }
 
 inline struct stat status_of(const std::string &path) {
@@ -77,12 +74,6 @@ inline std::vector<std::string> dir_entries(const std::string &dir) {
     }
     std::sort(names.begin(), names.end());
     return names;
-}
-
-// "acl." and four lowercase hex digits: a temporary name of the CACL writer.
-inline bool is_temp_name(const std::string &name) {
-    return name.size() == 8 && name.compare(0, 4, "acl.") == 0 &&
-           name.find_first_not_of("0123456789abcdef", 4) == std::string::npos;
 }
 
 // Message arguments in which a text starting with "$" stands for dir
@@ -123,13 +114,12 @@ inline std::string example_acl() {
 inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
 
 constexpr kx_uint32_t TEXT = SEC_F_ACL_TEXT, CACHE = SEC_F_ACL_CACHE, CONVERT = SEC_F_ACL_CONVERT;
-constexpr kx_uint32_t unset = 0xdeadbeef;
 
 // One call of sec_read_acl_file; the buffer is released with the object.
 // Members in this order: the status is computed once the outputs exist.
 struct acl_read {
     sec_buffer_s acl{0, nullptr};
-    kx_uint32_t rflags = unset;
+    kx_uint32_t rflags = 0xdeadbeef; // until the call sets it
     kx_int32_t status;
     acl_read(const std::string &file, kx_uint32_t flags, const char *user = nullptr,
              sec_perm_set_t permtmpl = nullptr)
@@ -157,35 +147,40 @@ struct acl_dir {
     }
 };
 
-// A user made for one test with useradd, removed again with userdel.
-class scoped_user {
-  public:
-    explicit scoped_user(const std::string &home) {
-        static int made = 0;
-        name_ = "kxt" + std::to_string(getpid()) + "x" + std::to_string(made++);
-        ok_ = run("useradd -M -N -s /usr/sbin/nologin -d '" + home + "' " + name_);
-    }
+// Runs flip just before the reader's system call of kind numbered nth
+// (counted from now): a name given to another file between its steps.
+inline void flip_before(kxacl::sys_call kind, long nth, std::function<void()> *flip) {
+    kxacl::sys_before_nth(
+        kind, nth, [](void *f) { (*static_cast<std::function<void()> *>(f))(); }, flip);
+}
+
+// The ACL compiled from text.
+inline std::string compiled(const std::string &text) {
+    acl_dir d(text);
+    return acl_read(d.acl, SEC_F_ACL_TEXT).bytes();
+}
+
+// A user made for one test with useradd, removed again with userdel. The
+// password files are locked while another useradd runs: commands are tried
+// again for up to 5 seconds.
+struct scoped_user {
+    static inline int made = 0;
+    std::string name = "kxt" + std::to_string(getpid()) + "x" + std::to_string(made++);
+    bool ok;
+    explicit scoped_user(const std::string &home)
+        : ok(run("useradd -M -N -s /usr/sbin/nologin -d '" + home + "' " + name)) {}
     ~scoped_user() {
-        if (ok_)
-            run("userdel " + name_);
+        if (ok)
+            run("userdel " + name);
     }
     scoped_user(const scoped_user &) = delete;
     scoped_user &operator=(const scoped_user &) = delete;
-    bool ok() const { return ok_; }
-    const std::string &name() const { return name_; }
-
-  private:
-    // The password files are locked while another useradd runs: try again.
     static bool run(const std::string &command) {
-        for (int attempt = 0; attempt < 50; ++attempt) {
+        for (int attempt = 0; attempt < 50; ++attempt, usleep(100000))
             if (std::system((command + " >/dev/null 2>&1").c_str()) == 0)
                 return true;
-            usleep(100000);
-        }
         return false;
     }
-    std::string name_;
-    bool ok_ = false;
 };
 
 #define KXTEST_REQUIRE_ROOT()                                                                      \

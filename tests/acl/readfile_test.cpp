@@ -1,9 +1,12 @@
-// sec_read_acl_file: what each ACL file and CACL file comes to, owner rules
-// with a user name, the longest cached path, allocation failures and the
-// Info and Perf trace points.
+// sec_read_acl_file: where it looks for the ACL file, what each ACL file and
+// CACL file comes to, the CACL file it writes, owner rules with a user
+// name, the longest cached path, allocation failures and trace points.
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <functional>
+#include <optional>
 #include <pwd.h>
 #include <string>
 #include <vector>
@@ -25,14 +28,70 @@ using items = std::vector<std::string>;
 
 namespace {
 
-// The buffer compiled from text.
-std::string compiled(const std::string &text) {
-    acl_dir d(text);
-    return acl_read(d.acl, TEXT).bytes();
-}
-
 std::string hex(const std::string &s) {
     return hex_of(s.data(), s.size());
+}
+
+// A relative name joins the working directory, a simple name with a user
+// the user's home (no second slash after "/"); a name with a path is
+// refused before the user is looked up.
+TEST(ReadAclFile, PathsBuiltFromTheWorkingDirectoryOrTheHome) {
+    // As getcwd gives it, whatever links lead to the temporary directory.
+    const std::string dir = std::filesystem::canonical(temp_dir()).string();
+    const std::string deep = path_of_length(dir, 3000), fits(1095, 'n');
+    ASSERT_EQ(mkdir(deep.c_str(), 0755), 0);
+    std::string longest(4097, 'a'); // not "/" + std::string: gcc 12 -O3 warns
+    longest[0] = '/';
+    const std::string home = getpwnam("root")->pw_dir, in_home(4095 - home.size(), 'n');
+    const char *nobody = "kx-no-such-user";
+    struct name_case {
+        std::string what, cwd, file;
+        const char *user;
+        kx_int32_t status;
+        int msg;
+        std::vector<arg> args;
+    };
+    std::vector<name_case> cases = {
+        // clang-format off
+        {"relative", dir, "none", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135, {dir + "/none", ENOENT}},
+        {"relative in /", "/", "kx-none-acl", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
+         {"/kx-none-acl", ENOENT}},
+        {"directory and name of 4096", deep, fits, nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
+         {deep + "/" + fits, ENAMETOOLONG}},
+        {"directory and name of 4097", deep, fits + "n", nullptr, SEC_S_NO_ACL_FILE, MSG_2650_167,
+         {deep, fits + "n"}},
+        {"full path of 4097", "/", longest, nullptr, SEC_S_NO_ACL_FILE, MSG_2650_135,
+         {longest, ENAMETOOLONG}},
+        {"unknown user", "/", "acl", nobody, SEC_S_USER_NOT_FOUND, MSG_2650_140, {nobody}},
+        {"path in the name", "/", "dir/acl", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"dir/acl", nobody}},
+        {"full path", "/", "/tmp/acl", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"/tmp/acl", nobody}},
+        {"trailing slash", "/", "acl/", nobody, SEC_S_BAD_PARAM, MSG_2650_165, {"acl/", nobody}},
+        {"home and name of 4096", "/", in_home, "root", SEC_S_NO_ACL_FILE, MSG_2650_135,
+         {home + "/" + in_home, ENAMETOOLONG}},
+        {"home and name of 4097", "/", in_home + "n", "root", SEC_S_BAD_PARAM, MSG_2650_165,
+         {in_home + "n", "root"}},
+        // clang-format on
+    };
+    std::optional<scoped_user> at_root; // whose home is "/"
+    if (geteuid() == 0) {
+        EXPECT_TRUE(at_root.emplace("/").ok);
+        cases.push_back({"home /",
+                         "/",
+                         "kx-none-acl",
+                         at_root->name.c_str(),
+                         SEC_S_NO_ACL_FILE,
+                         MSG_2650_135,
+                         {"/kx-none-acl", ENOENT}});
+    }
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.what);
+        ASSERT_EQ(chdir(c.cwd.c_str()), 0) << c.cwd;
+        acl_read r(c.file, CACHE, c.user);
+        EXPECT_EQ(r.status, c.status);
+        EXPECT_TRUE(record_is(c.status, c.msg, c.args));
+        EXPECT_TRUE(r.empty());
+        EXPECT_EQ(r.rflags, CACHE);
+    }
 }
 
 // Preparations of the directory before the read.
@@ -43,20 +102,20 @@ prepare cacl_of(const std::string &bytes, mode_t mode = 0644) {
 void read_once(const acl_dir &d) {
     acl_read(d.acl, CACHE);
 }
+prepare truncated(off_t size) { // holes: bytes 0
+    return [=](const acl_dir &d) { ASSERT_EQ(truncate(d.acl.c_str(), size), 0); };
+}
 
-// Everything a read hands back, and the CACL file it leaves. The flags
-// handed back show how: 0x1 once the text is compiled, 0x2 cleared when
-// nothing was cached, 0x4 cleared once compiling begins.
+// Everything a read hands back, and the CACL file it leaves, which when
+// written carries the text's owner, group and mode. The flags handed back
+// show how: 0x1 once the text is compiled, 0x2 cleared when nothing was
+// cached, 0x4 cleared once compiling begins.
 TEST(ReadAclFile, OutcomeOfEachAclAndCaclFile) {
     const std::string ex = example_acl(), n_r = compiled("n r\n"), garbage = "garbage";
     const std::string swapped(worked_example_swapped.begin(), worked_example_swapped.end());
     const std::string none = "<missing>";
-    const prepare nothing = [](const acl_dir &) {};
     struct {
         const char *what;
-        std::string text;
-        prepare setup;
-        const char *file;
         kx_uint32_t flags;
         kx_int32_t status;
         int msg;
@@ -64,63 +123,74 @@ TEST(ReadAclFile, OutcomeOfEachAclAndCaclFile) {
         std::string bytes;
         kx_uint32_t rflags;
         std::string cacl;
+        prepare setup = {};
+        std::string text = example_text;
+        const char *file = "acl";
         bool needs_root = false;
     } cases[] = {
         // clang-format off
-        {"compiled", example_text, nothing, "acl", CONVERT, SEC_S_OK, 0, {}, ex, TEXT, none},
-        {"comments only: nothing to cache", "# nothing here\n\n   \t# at all\n", nothing, "acl",
-         CACHE, SEC_S_OK, 0, {}, "", TEXT, none},
-        {"unknown type", "o r\ng staff rw\nx joe r\nn\n", nothing, "acl", CACHE | CONVERT | 0x100,
-         SEC_S_BAD_ACL, MSG_2650_179, {3, "x"}, "", TEXT | CACHE | 0x100, none},
-        {"duplicate entry", "g staff r\nu unix bob\ng STAFF w\n", nothing, "acl", CACHE,
-         SEC_S_BAD_ACLE, MSG_2650_175, {'g', "STAFF"}, "", TEXT | CACHE, none},
-        {"missing", example_text, nothing, "none", CACHE | CONVERT, SEC_S_NO_ACL_FILE, MSG_2650_135,
-         {"$/none", ENOENT}, "", CACHE | CONVERT, none},
-        {"a directory", example_text, nothing, ".", 0, SEC_S_NO_ACL_FILE, MSG_2650_135, {"$/.", 0},
-         "", 0, none},
-        {"empty: the CACL file is not looked at", "", cacl_of(ex), "acl", CACHE | 0x100, SEC_S_OK, 0,
-         {}, "", CACHE | 0x100, ex},
-        {"compiled and cached", example_text, nothing, "acl", CACHE, SEC_S_OK, 0, {}, ex,
-         TEXT | CACHE, ex},
-        {"cached", example_text, read_once, "acl", CACHE, SEC_S_OK, 0, {}, ex, 0, ex},
-        {"cached, converted", example_text, read_once, "acl", CACHE | CONVERT | 0x100, SEC_S_OK, 0,
-         {}, ex, CONVERT | 0x100, ex},
-        {"text changed since: compiled and cached again", example_text, [](const acl_dir &d) {
+        {"compiled", CONVERT, SEC_S_OK, 0, {}, ex, TEXT, none},
+        {"comments only: nothing to cache", CACHE, SEC_S_OK, 0, {}, "", TEXT, none, {},
+         "# nothing here\n\n   \t# at all\n"},
+        {"unknown type", CACHE | CONVERT | 0x100, SEC_S_BAD_ACL, MSG_2650_179, {3, "x"}, "",
+         TEXT | CACHE | 0x100, none, {}, "o r\ng staff rw\nx joe r\nn\n"},
+        {"duplicate entry", CACHE, SEC_S_BAD_ACLE, MSG_2650_175, {'g', "STAFF"}, "", TEXT | CACHE,
+         none, {}, "g staff r\nu unix bob\ng STAFF w\n"},
+        {"missing", CACHE | CONVERT, SEC_S_NO_ACL_FILE, MSG_2650_135, {"$/none", ENOENT}, "",
+         CACHE | CONVERT, none, {}, example_text, "none"},
+        {"a directory", 0, SEC_S_NO_ACL_FILE, MSG_2650_135, {"$/.", 0}, "", 0, none, {},
+         example_text, "."},
+        {"over the size limit: refused unread", CACHE, SEC_S_FILE_ERROR, MSG_2650_139,
+         {0, SEC_ACL_TEXT_MAX_SIZE + 1LL, EFBIG}, "", TEXT | CACHE, none,
+         truncated(SEC_ACL_TEXT_MAX_SIZE + 1), ""},
+        {"at the limit: read up to the first NUL", TEXT, SEC_S_OK, 0, {}, "", TEXT, none,
+         truncated(SEC_ACL_TEXT_MAX_SIZE), ""},
+        {"empty: the CACL file is not looked at", CACHE | 0x100, SEC_S_OK, 0, {}, "", CACHE | 0x100,
+         ex, cacl_of(ex), ""},
+        {"compiled and cached, set-id bit and all", CACHE, SEC_S_OK, 0, {}, ex, TEXT | CACHE, ex,
+         [](const acl_dir &d) { ASSERT_EQ(chmod(d.acl.c_str(), 04640), 0); }},
+        {"cached", CACHE, SEC_S_OK, 0, {}, ex, 0, ex, read_once},
+        {"cached, converted", CACHE | CONVERT | 0x100, SEC_S_OK, 0, {}, ex, CONVERT | 0x100, ex,
+         read_once},
+        {"text changed since: compiled and cached again", CACHE, SEC_S_OK, 0, {}, n_r,
+         TEXT | CACHE, n_r, [](const acl_dir &d) {
              read_once(d);
              write_file(d.acl, "n r\n");
              shift_mtime(d.acl, 100);
-         }, "acl", CACHE, SEC_S_OK, 0, {}, n_r, TEXT | CACHE, n_r},
-        {"CACL file of the same second: stale, replaced", example_text, [&](const acl_dir &d) {
+         }},
+        {"CACL file of the same second: stale, replaced", CACHE, SEC_S_OK, 0, {}, ex,
+         TEXT | CACHE, ex, [&](const acl_dir &d) {
              write_file(d.cacl, garbage);
              set_mtime(d.acl, 1700000000);
              set_mtime(d.cacl, 1700000000);
-         }, "acl", CACHE, SEC_S_OK, 0, {}, ex, TEXT | CACHE, ex},
-        {"empty CACL file: stale", example_text, cacl_of(""), "acl", 0, SEC_S_OK, 0, {}, ex, TEXT,
-         ""},
-        {"newer, yet 0x1 compiles", example_text, cacl_of(garbage), "acl", TEXT, SEC_S_OK, 0, {},
-         ex, TEXT, garbage},
-        {"newer: not replaced", example_text, cacl_of(garbage), "acl", TEXT | CACHE, SEC_S_OK, 0,
-         {}, ex, TEXT, garbage},
-        {"garbage, unchecked without 0x4", example_text, cacl_of(garbage), "acl", 0, SEC_S_OK, 0,
-         {}, garbage, 0, garbage},
-        {"garbage, refused with 0x4", example_text, cacl_of(garbage), "acl", CONVERT, SEC_S_OK, 0,
-         {}, ex, TEXT, garbage},
-        {"the other byte order, converted with 0x4", example_text, cacl_of(swapped), "acl",
-         CONVERT, SEC_S_OK, 0, {}, ex, CONVERT, swapped},
-        {"another mode: neither used nor replaced", example_text, cacl_of(garbage, 0600), "acl",
-         CACHE, SEC_S_OK, 0, {}, ex, TEXT, garbage},
-        {"hard-linked from elsewhere", example_text, [&](const acl_dir &d) {
+         }},
+        {"empty CACL file: stale", 0, SEC_S_OK, 0, {}, ex, TEXT, "", cacl_of("")},
+        {"newer, yet 0x1 compiles", TEXT, SEC_S_OK, 0, {}, ex, TEXT, garbage, cacl_of(garbage)},
+        {"newer: not replaced", TEXT | CACHE, SEC_S_OK, 0, {}, ex, TEXT, garbage, cacl_of(garbage)},
+        {"garbage, unchecked without 0x4", 0, SEC_S_OK, 0, {}, garbage, 0, garbage,
+         cacl_of(garbage)},
+        {"garbage, refused with 0x4", CONVERT, SEC_S_OK, 0, {}, ex, TEXT, garbage, cacl_of(garbage)},
+        {"the other byte order, converted with 0x4", CONVERT, SEC_S_OK, 0, {}, ex, CONVERT,
+         swapped, cacl_of(swapped)},
+        {"another mode: neither used nor replaced", CACHE, SEC_S_OK, 0, {}, ex, TEXT, garbage,
+         cacl_of(garbage, 0600)},
+        {"hard-linked from elsewhere", 0, SEC_S_OK, 0, {}, ex, TEXT, garbage, [&](const acl_dir &d) {
              write_file(d.cacl, garbage);
              ASSERT_EQ(link(d.cacl.c_str(), (d.dir + "/elsewhere").c_str()), 0);
-         }, "acl", 0, SEC_S_OK, 0, {}, ex, TEXT, garbage},
-        {"a symbolic link, never followed", example_text, [](const acl_dir &d) {
+         }},
+        {"a symbolic link, never followed", CACHE, SEC_S_OK, 0, {}, ex, TEXT, "n r\n",
+         [](const acl_dir &d) {
              write_file(d.dir + "/target", "n r\n"); // newer, same owner and mode
              ASSERT_EQ(symlink((d.dir + "/target").c_str(), d.cacl.c_str()), 0);
-         }, "acl", CACHE, SEC_S_OK, 0, {}, ex, TEXT, "n r\n"},
-        {"another owner: neither used nor replaced", "n r\n", [&](const acl_dir &d) {
+         }},
+        {"another owner: neither used nor replaced", CACHE, SEC_S_OK, 0, {}, n_r, TEXT, ex,
+         [&](const acl_dir &d) {
              write_file(d.cacl, ex);
              ASSERT_EQ(chown(d.cacl.c_str(), 65534, 65534), 0);
-         }, "acl", CACHE, SEC_S_OK, 0, {}, n_r, TEXT, ex, true},
+         }, "n r\n", "acl", true},
+        {"the text's owner given to the CACL file", CACHE, SEC_S_OK, 0, {}, ex, TEXT | CACHE, ex,
+         [](const acl_dir &d) { ASSERT_EQ(chown(d.acl.c_str(), 65534, 65533), 0); },
+         example_text, "acl", true},
         // clang-format on
     };
     for (const auto &c : cases) {
@@ -128,7 +198,8 @@ TEST(ReadAclFile, OutcomeOfEachAclAndCaclFile) {
         if (c.needs_root && geteuid() != 0)
             continue;
         acl_dir d(c.text);
-        c.setup(d);
+        if (c.setup)
+            c.setup(d);
         acl_read r(d.dir + "/" + c.file, c.flags);
         EXPECT_EQ(r.status, c.status);
         EXPECT_TRUE(record_is(c.status, c.msg, in_dir(d.dir, c.args)));
@@ -136,8 +207,38 @@ TEST(ReadAclFile, OutcomeOfEachAclAndCaclFile) {
         EXPECT_EQ(r.bytes().empty(), r.empty());
         EXPECT_EQ(r.rflags, c.rflags);
         EXPECT_EQ(read_file(d.cacl), c.cacl);
-        for (const auto &name : dir_entries(d.dir))
-            EXPECT_FALSE(is_temp_name(name)) << name;
+        if (c.status == SEC_S_OK && (r.rflags & (TEXT | CACHE)) == (TEXT | CACHE)) {
+            struct stat a = status_of(d.acl), k = status_of(d.cacl);
+            EXPECT_EQ(k.st_mode, a.st_mode);
+            EXPECT_EQ(k.st_uid, a.st_uid);
+            EXPECT_EQ(k.st_gid, a.st_gid);
+        }
+        for (const auto &name : dir_entries(d.dir)) // no temporary file left
+            EXPECT_TRUE(name.rfind("acl.", 0) != 0 || name == "acl.cacl") << name;
+    }
+}
+
+// Temporary names that are taken are drawn again, and never followed: with
+// half of them taken a free one turns up; with all taken nothing is cached,
+// and the empty CACL file made meanwhile goes again.
+TEST(ReadAclFile, TakenTemporaryNames) {
+    acl_dir d;
+    const std::string target = d.dir + "/target";
+    write_file(target, "target bytes");
+    for (unsigned first : {0u, 1u}) {
+        SCOPED_TRACE(first ? "all taken" : "half taken");
+        char suffix[8];
+        for (unsigned n = first; n < 0x10000; n += 2) {
+            std::snprintf(suffix, sizeof suffix, ".%04x", n);
+            ASSERT_EQ(symlink(target.c_str(), (d.acl + suffix).c_str()), 0);
+        }
+        acl_read r(d.acl, TEXT | CACHE);
+        EXPECT_EQ(r.status, SEC_S_OK);
+        EXPECT_EQ(r.rflags, first ? TEXT : TEXT | CACHE);
+        EXPECT_EQ(read_file(d.cacl), first ? "<missing>" : example_acl());
+        EXPECT_EQ(dir_entries(d.dir).size(), first ? 0x10000u + 2 : 0x8000u + 3);
+        EXPECT_EQ(read_file(target), "target bytes");
+        unlink(d.cacl.c_str());
     }
 }
 
@@ -155,7 +256,7 @@ TEST(ReadAclFile, PermissionsUseTheCallersTemplates) {
 }
 
 // A path of 4089 characters is the longest whose CACL file is written and
-// then read; longer ones are compiled each time and leave no record.
+// then read; longer ones are compiled each time and leave no file.
 TEST(ReadAclFile, LongestCachedPathIsReused) {
     std::string base = temp_dir();
     for (std::size_t length : {4089u, 4090u, 4092u}) {
@@ -174,14 +275,8 @@ TEST(ReadAclFile, LongestCachedPathIsReused) {
         ASSERT_EQ(second.status, SEC_S_OK);
         EXPECT_EQ(second.rflags, cached ? 0u : TEXT);
         EXPECT_EQ(second.bytes(), example_acl());
+        EXPECT_EQ(dir_entries(path.substr(0, path.rfind('/'))).size(), cached ? 2u : 1u);
     }
-}
-
-// Gives the name "acl" in the directory at dir to the file "staged" there;
-// the hook of sys_before_nth.
-void swap_in(void *dir) {
-    const std::string &d = *static_cast<const std::string *>(dir);
-    ASSERT_EQ(rename((d + "/staged").c_str(), (d + "/acl").c_str()), 0);
 }
 
 // With a user name the file must be the user's and writable by nobody
@@ -191,9 +286,9 @@ TEST(ReadAclFile, UsersFileRules) {
     KXTEST_REQUIRE_ROOT();
     std::string home = temp_dir();
     scoped_user user(home);
-    if (!user.ok())
+    if (!user.ok)
         GTEST_SKIP() << "SKIPPED: useradd failed";
-    const uid_t uid = getpwnam(user.name().c_str())->pw_uid;
+    const uid_t uid = getpwnam(user.name.c_str())->pw_uid;
     struct {
         const char *what;
         const char *text;
@@ -213,32 +308,32 @@ TEST(ReadAclFile, UsersFileRules) {
         {"root's empty file swapped in", example_text, true, 0644, TEXT, SEC_S_BAD_PERMISSION, TEXT,
          ""},
     };
-    const std::string staged = home + "/staged", acl = home + "/acl";
+    const std::string acl = home + "/acl", staged = home + "/staged";
     for (const auto &c : cases) {
         SCOPED_TRACE(c.what);
         write_file(acl, c.text, c.mode);
         ASSERT_EQ(chown(acl.c_str(), c.users ? uid : 0, static_cast<gid_t>(-1)), 0);
+        std::function<void()> swap = [&] { EXPECT_EQ(rename(staged.c_str(), acl.c_str()), 0); };
         if (c.swapped_in) {
             write_file(staged, c.swapped_in);
-            sys_before_nth(sys_call::open, 0, swap_in, &home);
+            flip_before(sys_call::open, 0, &swap);
         }
-        acl_read r("acl", c.flags, user.name().c_str());
+        acl_read r("acl", c.flags, user.name.c_str());
         EXPECT_EQ(sys_fault_fired(), c.swapped_in != nullptr);
         EXPECT_EQ(r.status, c.status);
         EXPECT_TRUE(c.status == SEC_S_OK ? record_is(SEC_S_OK, 0, {})
-                                         : record_is(c.status, MSG_2650_141, {acl, user.name()}));
+                                         : record_is(c.status, MSG_2650_141, {acl, user.name}));
         EXPECT_EQ(r.bytes(), *c.text && c.status == SEC_S_OK ? example_acl() : "");
         EXPECT_EQ(r.rflags, c.rflags);
     }
 }
-
-// ---- allocation failures ---------------------------------------------------
 
 TEST(ReadAclFile, EveryAllocationFailureOnTheCompilePathIsReported) {
     acl_dir d("u unix bob rw\nu unix ann r\ng staff r\ng wheel rw\no r\ne krb x@Y w\n");
     const std::string text = read_file(d.acl), expected = compiled(text);
     int failures = 0;
     for (long n = 0; n < 1000; ++n) {
+        SCOPED_TRACE(n);
         mem_fail_after(n);
         acl_read r(d.acl, CACHE);
         mem_fail_after(-1);
@@ -248,15 +343,15 @@ TEST(ReadAclFile, EveryAllocationFailureOnTheCompilePathIsReported) {
             break;
         }
         ++failures;
-        EXPECT_EQ(r.status, SEC_S_NO_MEMORY) << n;
-        EXPECT_EQ(last_error().msg_num, MSG_2650_102) << n;
+        EXPECT_EQ(r.status, SEC_S_NO_MEMORY);
+        EXPECT_EQ(last_error().msg_num, MSG_2650_102);
         if (n == 0) { // the window over the text, which it holds whole
             EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102,
                                   {"sec_read_acl_file", static_cast<long long>(text.size() + 1)}));
         }
-        EXPECT_TRUE(r.empty()) << n;
-        EXPECT_EQ(r.rflags, TEXT | CACHE) << n;
-        EXPECT_EQ(dir_entries(d.dir), (std::vector<std::string>{"acl"})) << n;
+        EXPECT_TRUE(r.empty());
+        EXPECT_EQ(r.rflags, TEXT | CACHE);
+        EXPECT_EQ(dir_entries(d.dir), (std::vector<std::string>{"acl"}));
     }
     EXPECT_GE(failures, 8) << "the file, the trees, their entries and the buffer";
 }
@@ -272,8 +367,6 @@ TEST(ReadAclFile, NoMemoryForTheUserLookup) {
     EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"sec__get_user_info", expected}));
     EXPECT_TRUE(r.empty());
 }
-
-// ---- trace points ----------------------------------------------------------
 
 // An empty file, a compile that caches, a cached read, and reads beside a
 // CACL file of another mode and beside a symbolic link (judged by its own
