@@ -87,30 +87,6 @@ TEST(ConvertAclToHost, Outcomes) {
     }
 }
 
-// Each makes one allocation; on failure the descriptor keeps its length.
-TEST(AllocationFailure, ReadAclFromDataAndCreateEmptyAcl) {
-    bytes b = worked_example;
-    for (bool create : {false, true}) {
-        EXPECT_EQ(for_each_allocation_failure([&](long n) {
-                      owned_acl acl;
-                      acl.d.length = -3;
-                      kx_int32_t rc = failing_after(n, [&] {
-                          return create ? sec_create_empty_acl(acl.get())
-                                        : sec_read_acl_from_data(71, b.data(), acl.get());
-                      });
-                      if (rc != SEC_S_OK) {
-                          expect_no_memory(
-                              rc, {create ? "sec_create_empty_acl" : "sec_read_acl_from_data"});
-                          EXPECT_EQ(last_error().num(1), create ? 5 : 71);
-                          EXPECT_EQ(acl.d.length, -3);
-                          EXPECT_EQ(acl.d.value, nullptr);
-                      }
-                      return rc;
-                  }),
-                  1);
-    }
-}
-
 // ---- listing ---------------------------------------------------------------
 
 // type 0 lists everything; a failure leaves the list empty.
@@ -224,33 +200,6 @@ TEST(ListAcl, ReleaseEmptiesTheListOnce) {
     EXPECT_EQ(list.acles, nullptr);
     sec_release_aclelist(&list);
     sec_release_aclelist(nullptr);
-}
-
-// Every allocation of a listing fails in turn: the list ends empty. User and
-// group entries in ascending order take the list and one block per entry,
-// with no tree; the other sub-ACLs build trees as well. The counts are exact,
-// so that a listing that builds a tree it does not need is noticed.
-TEST(AllocationFailure, ListAclAndListAclByType) {
-    bytes rich = rich_acl();
-    for (auto [type, allocations] :
-         {std::pair<unsigned char, long>{0, 25}, {SEC_ACLE_USER, 6}, {SEC_ACLE_GROUP, 3}}) {
-        EXPECT_EQ(for_each_allocation_failure([&](long n) {
-                      owned_acl acl(rich);
-                      owned_list list;
-                      kx_int32_t rc = failing_after(n, [&] {
-                          return type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
-                                      : sec_list_acl(acl.get(), list.get());
-                      });
-                      if (rc != SEC_S_OK) {
-                          expect_no_memory(rc, {"sec__create_acle", "sec__add_acle_to_tree",
-                                                "sec__acltree_to_aclelist"});
-                          EXPECT_EQ(list.l.count, 0);
-                          EXPECT_EQ(list.l.acles, nullptr);
-                      }
-                      return rc;
-                  }),
-                  allocations);
-    }
 }
 
 // ---- editing ---------------------------------------------------------------
@@ -384,52 +333,6 @@ TEST(EditRoundTrip, AddThenDeleteRestoresTheBuffer) {
         ASSERT_EQ(del(acl, removed), SEC_S_OK);
         EXPECT_EQ(acl.contents(), c.base);
     }
-}
-
-enum class edit { add, add_only, del };
-
-kx_int32_t run(edit how, owned_acl &acl, entry e) {
-    return how == edit::add ? add(acl, e) : how == edit::add_only ? add_only(acl, e) : del(acl, e);
-}
-
-// Every allocation of an edit fails in turn. A failed add leaves the
-// buffer as it was; so does a failed delete, unless only its final shrink
-// failed, which leaves the valid ACL without the entry.
-void expect_failed_edits_harmless(edit how, const bytes &base, entry e) {
-    owned_acl done(base);
-    ASSERT_EQ(run(how, done, e), SEC_S_OK);
-    bool shrink_failed = false;
-    long failures = for_each_allocation_failure([&](long n) {
-        owned_acl acl(base);
-        kx_int32_t rc = failing_after(n, [&] { return run(how, acl, e); });
-        if (rc == SEC_S_OK)
-            return rc;
-        expect_no_memory(rc, {how == edit::del ? "sec_del_acle_from_acl" : "sec_add_acle_to_acl",
-                              "sec__create_acle", "sec__add_acle_to_tree", "sec__acltree_to_subacl",
-                              "sec__add_acle_to_subacl"});
-        if (how == edit::del && acl.contents() != base) {
-            shrink_failed = true;
-            EXPECT_EQ(last_error().str(0), "sec_del_acle_from_acl");
-            EXPECT_EQ(acl.contents(), done.contents());
-        } else {
-            EXPECT_EQ(acl.contents(), base);
-            EXPECT_EQ(acl.d.value == nullptr, base.empty());
-        }
-        return rc;
-    });
-    EXPECT_GE(failures, 2);
-    EXPECT_EQ(shrink_failed, how == edit::del);
-}
-
-TEST(AllocationFailure, EditsOfAnAcl) {
-    for (edit how : {edit::add, edit::add_only}) {
-        expect_failed_edits_harmless(how, {}, {SEC_ACLE_USER, 1, "unix", "bob"});
-        expect_failed_edits_harmless(how, worked_example, {SEC_ACLE_USER, 1, "unix", "carol"});
-        expect_failed_edits_harmless(how, worked_example, {SEC_ACLE_EXPANDED, 1, "unix", "x*"});
-    }
-    // The sub-ACL goes with its only entry, or stays shorter.
-    expect_failed_edits_harmless(edit::del, worked_example, {SEC_ACLE_USER, 0, "unix", "bob"});
-    expect_failed_edits_harmless(edit::del, rich_acl(), {SEC_ACLE_EXPANDED, 0, "unix", "z*@node2"});
 }
 
 } // namespace

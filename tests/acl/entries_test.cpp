@@ -8,7 +8,6 @@
 
 #include <kx_acl.h>
 
-#include "alloc.h"
 #include "messages.h"
 #include "support.h"
 
@@ -108,33 +107,6 @@ TEST(DisplayAcle, MechanismFillingItsField) {
     displayed full(&acle);
     ASSERT_EQ(full.status, SEC_S_OK);
     EXPECT_EQ(std::string(full.mech), std::string(16, 'm'));
-}
-
-// Every allocation of entry creation may fail: the failure is reported
-// with its routine and size, and no entry is handed out. (Found by failing
-// each allocation: when the identity's host part could not be normalised,
-// the caller's pointer was left as it was instead of null.)
-TEST(CreateAcle, EveryAllocationFailureIsReported) {
-    int failures = 0;
-    for (long n = 0;; ++n) {
-        kxacl::mem_fail_after(n);
-        sec_acle_t acle = reinterpret_cast<sec_acle_t>(1);
-        kx_int32_t rc = sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@0:0:0:0:0:0:0:1", &acle);
-        kxacl::mem_fail_after(-1);
-        if (rc == SEC_S_OK) {
-            EXPECT_STREQ(acle->id, "bob@::1");
-            sec_release_acle(acle);
-            break;
-        }
-        ++failures;
-        EXPECT_EQ(rc, SEC_S_NO_MEMORY);
-        EXPECT_EQ(acle, nullptr);
-        auto e = kxtest::last_error();
-        EXPECT_EQ(e.msg_num, 89);
-        EXPECT_TRUE(e.str(0) == "sec_create_acle" || e.str(0) == "sec__create_acle") << e.str(0);
-        EXPECT_GT(e.num(1), 0);
-    }
-    EXPECT_EQ(failures, 2);
 }
 
 TEST(Codesets, Latin1IsStoredAsUtf8AndDisplayedBack) {
