@@ -37,13 +37,6 @@ struct displayed {
     }
 };
 
-// 2650-101 for the parameter, whose value shows as its low 32 bits.
-void expect_bad_param(const char *routine, int position, const void *value) {
-    int shown =
-        static_cast<int>(static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(value)));
-    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, kxacl::MSG_2650_101, {routine, position, shown}));
-}
-
 // Stored and displayed mechanism and identity; null for none.
 TEST(CreateAcle, StoresOnlyWhatTheTypeCarries) {
     const struct {
@@ -66,6 +59,13 @@ TEST(CreateAcle, StoresOnlyWhatTheTypeCarries) {
         EXPECT_STREQ(d.mech, c.shown_mech);
         EXPECT_STREQ(d.id, c.stored_id);
     }
+    // A mechanism field filled to the last byte is read as 16 characters.
+    char joe[] = "joe";
+    sec_acle_desc full{0, {}, SEC_ACLE_USER, joe};
+    std::memset(full.mech, 'm', sizeof full.mech);
+    displayed d(&full);
+    ASSERT_EQ(d.status, SEC_S_OK);
+    EXPECT_EQ(std::string(d.mech), std::string(16, 'm'));
 }
 
 // The host part of unix and vgn2 identities in its canonical form; those
@@ -97,18 +97,6 @@ TEST(CreateAcle, HostIdentitiesOfUnixAndVgn2) {
     }
 }
 
-// A mechanism field filled to the last byte is read as 16 characters.
-TEST(DisplayAcle, MechanismFillingItsField) {
-    char joe[] = "joe";
-    sec_acle_desc acle{};
-    acle.type = SEC_ACLE_USER;
-    acle.id = joe;
-    std::memset(acle.mech, 'm', sizeof acle.mech);
-    displayed full(&acle);
-    ASSERT_EQ(full.status, SEC_S_OK);
-    EXPECT_EQ(std::string(full.mech), std::string(16, 'm'));
-}
-
 TEST(Codesets, Latin1IsStoredAsUtf8AndDisplayedBack) {
     ASSERT_TRUE(kxtest::use_build_locale("en_US.ISO-8859-1")) << "the test locale was not built";
     const char latin1[] = "j\xe9r\xf4me";
@@ -126,7 +114,9 @@ TEST(Codesets, Latin1IsStoredAsUtf8AndDisplayedBack) {
     created u(SEC_ACLE_USER, 1, mech, "joe@host");
     EXPECT_EQ(u.status, SEC_S_BAD_PARAM);
     EXPECT_EQ(u.acle, nullptr);
-    expect_bad_param("sec_create_acle", 3, mech);
+    auto shown =
+        static_cast<int>(static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(mech)));
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, kxacl::MSG_2650_101, {"sec_create_acle", 3, shown}));
 }
 
 TEST(Codesets, UnconvertibleTextsFail) {
