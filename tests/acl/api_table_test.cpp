@@ -463,16 +463,13 @@ std::vector<traced_call> traced_calls() {
              sec_release_aclelist(w.list.get());
              return ok; }},
         {"sec_add_acle_to_acl", 60, 63, clears, [](world &w, expected &x) {
-             x.at(62, edit_items(w));
-             x.at(64, {i32(ok)});
+             x.at(62, edit_items(w)), x.at(64, {i32(ok)});
              return sec_add_acle_to_acl(w.carol.p(), w.acl.get()); }},
         {"sec_add_acle_to_acl2 refusing", 60, 63, clears, [](world &w, expected &x) {
-             x.at(62, edit_items(w));
-             x.at(64, {i32(SEC_S_BAD_ACLE)});
+             x.at(62, edit_items(w)), x.at(64, {i32(SEC_S_BAD_ACLE)});
              return sec_add_acle_to_acl2(w.carol.p(), w.acl.get()); }},
         {"sec_del_acle_from_acl", 65, 68, clears, [](world &w, expected &x) {
-             x.at(67, edit_items(w));
-             x.at(69, {i32(ok)});
+             x.at(67, edit_items(w)), x.at(69, {i32(ok)});
              return sec_del_acle_from_acl(w.carol.p(), w.acl.get()); }},
         {"sec__register_id_handler", 74, 77, clears, [](world &, expected &x) {
              sec_acl_id_handler h = handler;
