@@ -1,6 +1,6 @@
 // Shared helpers of the ACL buffer tests: known buffers byte for byte,
 // hand-made buffer pieces, entries in test-owned storage, descriptors that
-// own exactly-sized copies, and the allocation failure loop.
+// own exactly-sized copies.
 #ifndef KXACL_TEST_ACL_FIXTURES_H
 #define KXACL_TEST_ACL_FIXTURES_H
 
@@ -8,7 +8,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <initializer_list>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -214,32 +213,6 @@ inline error_record expect_error(kx_int32_t status, int msg) {
     EXPECT_EQ(e.id, status);
     EXPECT_EQ(e.msg_num, msg);
     return e;
-}
-
-// Expects rc to be an allocation failure reported by one of routines.
-inline void expect_no_memory(kx_int32_t rc, const std::set<std::string> &routines) {
-    EXPECT_EQ(rc, SEC_S_NO_MEMORY);
-    error_record e = expect_error(SEC_S_NO_MEMORY, kxacl::MSG_2650_102);
-    EXPECT_TRUE(routines.count(e.str(0))) << e.str(0);
-    EXPECT_GT(e.num(1), 0);
-}
-
-// Runs call with every allocation after the first n failing.
-template <typename Call> kx_int32_t failing_after(long n, Call call) {
-    kxacl::mem_fail_after(n);
-    kx_int32_t rc = call();
-    kxacl::mem_fail_after(-1);
-    return rc;
-}
-
-// Calls attempt(n), which makes allocation n fail and checks the outcome,
-// for n = 0, 1, ... until it succeeds; returns the number of failures.
-template <typename Attempt> long for_each_allocation_failure(Attempt attempt) {
-    for (long n = 0; n < 100000; ++n)
-        if (attempt(n) == SEC_S_OK)
-            return n;
-    ADD_FAILURE() << "the call never succeeded";
-    return -1;
 }
 
 } // namespace kxtest

@@ -3,7 +3,6 @@
 // alone; and the API trace points its calls record at each API level. Each
 // TEST runs in a process of its own, so the levels set before its first
 // library call are the ones that trace registration reads.
-#include <cerrno>
 #include <climits>
 #include <functional>
 #include <string>
@@ -51,14 +50,19 @@ long long shown(const void *p) {
     return static_cast<int>(pointer_value(p));
 }
 
+using run_fn = std::function<kx_int32_t(outputs &)>;
 struct refusal {
-    const char *call;
     kx_int32_t status;
     int msg;
     std::vector<arg> args;
-    std::function<kx_int32_t(outputs &)> run;
+    run_fn run;
     std::function<void(const outputs &)> left = nullptr; // else: every output untouched
 };
+
+// 2650-101 for the routine's parameter at pos.
+refusal param(const char *routine, int pos, long long value, run_fn run) {
+    return {SEC_S_BAD_PARAM, MSG_2650_101, {routine, pos, value}, std::move(run)};
+}
 
 unsigned char *data_of(const bytes &b) {
     return const_cast<unsigned char *>(b.data());
@@ -78,6 +82,15 @@ kx_int32_t edit_of(kx_int32_t (*edit)(sec_acle_t, sec_acl_buffer_t), entry e, co
     return rc;
 }
 
+kx_int32_t display(entry &e, outputs &o) {
+    return sec_display_acle_id(e.p(), &o.mech, &o.id);
+}
+
+kx_int32_t read_with(const char *name, const char *user, kx_uint32_t flags, sec_buffer_s *acl,
+                     outputs &o) {
+    return sec_read_acl_file(name, user, nullptr, flags, acl, &o.rflags);
+}
+
 kx_int32_t never_called(char *, char *) {
     return 0;
 }
@@ -92,247 +105,204 @@ std::vector<refusal> refusals() {
     static sec_buffer_s empty{0, nullptr}, no_value{71, nullptr};
     static char long_mech[] = "0123456789abcdefg", nothing[] = "", no_at[] = "bob",
                 no_host[] = "bob@", unix_mech[] = "unix";
-    const std::string reg = "acl__register_id_handler", one = "sec__single_acle_perm",
-                      groups = "sec__group_acles_perm";
+    const char *reg = "acl__register_id_handler", *one = "sec__single_acle_perm",
+               *groups = "sec__group_acles_perm", *create = "sec_create_acle",
+               *show = "sec_display_acle_id", *from_data = "sec_read_acl_from_data",
+               *by_type = "sec_list_acl_by_type", *add = "sec_add_acle_to_acl",
+               *del = "sec_del_acle_from_acl", *read = "sec_read_acl_file";
+    const kx_int32_t acl = SEC_S_BAD_ACL, acle = SEC_S_BAD_ACLE, perm = SEC_S_BAD_PERMISSION;
+    auto nothing_out = [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); };
 
     // clang-format off
     std::vector<refusal> rows = {
-        {"translate_perms: no result", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_translate_perms", 3, 0},
-         [](outputs &) { return sec_translate_perms("r", nullptr, nullptr); }},
-        {"translate_perms: earlier bits stay", SEC_S_BAD_PERMISSION, MSG_2650_146, {'z'},
+        param("sec_translate_perms", 3, 0,
+         [](outputs &) { return sec_translate_perms("r", nullptr, nullptr); }),
+        {perm, MSG_2650_146, {'z'},
          [](outputs &o) { return sec_translate_perms("rwz", nullptr, &o.perm); },
-         [](const outputs &o) {
+         [](const outputs &o) { // the bits before it stay
              EXPECT_EQ(o.perm, 0x3u);
              EXPECT_NE(last_error().text.find("permission ('z') does not"), std::string::npos);
          }},
-        {"translate_perms: case counts", SEC_S_BAD_PERMISSION, MSG_2650_146, {'R'},
+        {perm, MSG_2650_146, {'R'},
          [](outputs &o) { return sec_translate_perms("R", nullptr, &o.perm); },
          [](const outputs &o) { EXPECT_EQ(o.perm, 0u); }},
-        {"translate_bitmask: no result", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_translate_mask", 3, 0},
-         [](outputs &) { return sec_translate_bitmask(1, nullptr, nullptr); }},
-        {"translate_bitmask: bit 13", SEC_S_BAD_PERMISSION, MSG_2650_178, {0x2000},
+        param("sec_translate_mask", 3, 0,
+         [](outputs &) { return sec_translate_bitmask(1, nullptr, nullptr); }),
+        {perm, MSG_2650_178, {0x2000},
          [](outputs &) { char out[33]; return sec_translate_bitmask(0x2000, nullptr, out); },
          [](const outputs &) {
              EXPECT_NE(last_error().text.find("(0x00002000)"), std::string::npos);
          }},
-        {"translate_bitmask: lowest bit without template", SEC_S_BAD_PERMISSION, MSG_2650_178,
-         {INT_MIN},
+        {perm, MSG_2650_178, {INT_MIN},
          [](outputs &) { char out[33]; return sec_translate_bitmask(0x80000001u, nullptr, out); }},
-        {"create_acle: type", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 1, 3},
-         [](outputs &o) { return sec_create_acle(3, 0, "unix", "a@b", &o.acle); }},
-        {"create_acle: long mech", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_create_acle", 3, shown(long_mech)},
-         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 0, long_mech, "a@b", &o.acle); }},
-        {"create_acle: no mech", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 3, 0},
-         [](outputs &o) { return sec_create_acle(SEC_ACLE_EXPANDED, 0, nullptr, "x", &o.acle); }},
-        {"create_acle: empty id", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_create_acle", 4, shown(nothing)},
-         [](outputs &o) { return sec_create_acle(SEC_ACLE_GROUP, 0, nullptr, nothing, &o.acle); }},
-        {"create_acle: no result", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_create_acle", 5, 0},
-         [](outputs &) { return sec_create_acle(SEC_ACLE_GROUP, 0, nullptr, "g", nullptr); }},
+        param(create, 1, 3,
+         [](outputs &o) { return sec_create_acle(3, 0, "unix", "a@b", &o.acle); }),
+        param(create, 3, shown(long_mech),
+         [](outputs &o) { return sec_create_acle(4, 0, long_mech, "a@b", &o.acle); }),
+        param(create, 3, 0,
+         [](outputs &o) { return sec_create_acle(8, 0, nullptr, "x", &o.acle); }),
+        param(create, 4, shown(nothing),
+         [](outputs &o) { return sec_create_acle(16, 0, nullptr, nothing, &o.acle); }),
+        param(create, 5, 0,
+         [](outputs &) { return sec_create_acle(16, 0, nullptr, "g", nullptr); }),
         // A unix or vgn2 user's identity needs a host part: no entry is handed out.
-        {"create_acle: unix user without host", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_create_acle", 4, shown(no_at)},
-         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 1, "unix", no_at, &o.acle); },
+        {SEC_S_BAD_PARAM, MSG_2650_101, {create, 4, shown(no_at)},
+         [](outputs &o) { return sec_create_acle(4, 1, "unix", no_at, &o.acle); },
          [](const outputs &o) { EXPECT_EQ(o.acle, nullptr); }},
-        {"create_acle: vgn2 user, empty host", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_create_acle", 4, shown(no_host)},
-         [](outputs &o) { return sec_create_acle(SEC_ACLE_USER, 1, "vgn2", no_host, &o.acle); },
+        {SEC_S_BAD_PARAM, MSG_2650_101, {create, 4, shown(no_host)},
+         [](outputs &o) { return sec_create_acle(4, 1, "vgn2", no_host, &o.acle); },
          [](const outputs &o) { EXPECT_EQ(o.acle, nullptr); }},
-        {"display_acle_id: no entry", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_display_acle_id", 1, 0},
-         [](outputs &o) { return sec_display_acle_id(nullptr, &o.mech, &o.id); }},
-        {"display_acle_id: no mech result", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_display_acle_id", 2, 0},
-         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), nullptr, &o.id); }},
-        {"display_acle_id: no id result", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_display_acle_id", 3, 0},
-         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), &o.mech, nullptr); }},
+        param(show, 1, 0,
+         [](outputs &o) { return sec_display_acle_id(nullptr, &o.mech, &o.id); }),
+        param(show, 2, 0,
+         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), nullptr, &o.id); }),
+        param(show, 3, 0,
+         [](outputs &o) { entry e{1, 1}; return sec_display_acle_id(e.p(), &o.mech, nullptr); }),
         // Past the argument checks, a failure leaves both outputs null.
-        {"display_acle_id: type 7", SEC_S_BAD_ACLE, MSG_2650_107, {7},
-         [](outputs &o) { entry e{7, 1}; return sec_display_acle_id(e.p(), &o.mech, &o.id); },
-         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
-        {"display_acle_id: group, empty id", SEC_S_BAD_ACLE, MSG_2650_108, {},
-         [](outputs &o) {
-             entry e{SEC_ACLE_GROUP, 1, "", ""};
-             return sec_display_acle_id(e.p(), &o.mech, &o.id);
-         },
-         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
-        {"display_acle_id: user without mech", SEC_S_BAD_ACLE, MSG_2650_108, {},
-         [](outputs &o) {
-             entry e{SEC_ACLE_USER, 1, "", "joe"};
-             return sec_display_acle_id(e.p(), &o.mech, &o.id);
-         },
-         [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); }},
-        {"create_empty_acl: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_create_empty_acl", 1, 0},
-         [](outputs &) { return sec_create_empty_acl(nullptr); }},
-        {"read_acl_from_data: length 0", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_read_acl_from_data", 1, 0},
-         [](outputs &o) { return sec_read_acl_from_data(0, data_of(worked_example), &o.acl); }},
-        {"read_acl_from_data: length -1", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_read_acl_from_data", 1, -1},
-         [](outputs &o) { return sec_read_acl_from_data(-1, data_of(worked_example), &o.acl); }},
-        {"read_acl_from_data: no bytes", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_read_acl_from_data", 2, 0},
-         [](outputs &o) { return sec_read_acl_from_data(5, nullptr, &o.acl); }},
-        {"read_acl_from_data: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_read_acl_from_data", 3, 0},
-         [](outputs &) { return sec_read_acl_from_data(5, data_of(worked_example), nullptr); }},
-        {"convert_acl_to_host: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_convert_acl_to_host", 1, 0},
-         [](outputs &) { return sec_convert_acl_to_host(1, nullptr); }},
+        {acle, MSG_2650_107, {7},
+         [](outputs &o) { entry e{7, 1}; return display(e, o); },
+         nothing_out},
+        {acle, MSG_2650_108, {},
+         [](outputs &o) { entry e{16, 1, "", ""}; return display(e, o); },
+         nothing_out},
+        {acle, MSG_2650_108, {},
+         [](outputs &o) { entry e{4, 1, "", "joe"}; return display(e, o); },
+         nothing_out},
+        param("sec_create_empty_acl", 1, 0,
+         [](outputs &) { return sec_create_empty_acl(nullptr); }),
+        param(from_data, 1, 0,
+         [](outputs &o) { return sec_read_acl_from_data(0, data_of(worked_example), &o.acl); }),
+        param(from_data, 1, -1,
+         [](outputs &o) { return sec_read_acl_from_data(-1, data_of(worked_example), &o.acl); }),
+        param(from_data, 2, 0,
+         [](outputs &o) { return sec_read_acl_from_data(5, nullptr, &o.acl); }),
+        param(from_data, 3, 0,
+         [](outputs &) { return sec_read_acl_from_data(5, data_of(worked_example), nullptr); }),
+        param("sec_convert_acl_to_host", 1, 0,
+         [](outputs &) { return sec_convert_acl_to_host(1, nullptr); }),
         // Bytes that are no ACL buffer are not freed (owned_acl frees them).
-        {"release_acl: no ACL buffer", SEC_S_BAD_ACL, MSG_2650_106, {},
-         [](outputs &) {
-             owned_acl acl(bad_type);
-             void *value = acl.d.value;
-             kx_int32_t rc = sec_release_acl(acl.get());
-             EXPECT_TRUE(acl.d.value == value && acl.d.length == 71);
+        {acl, MSG_2650_106, {}, [](outputs &) {
+             owned_acl a(bad_type);
+             void *value = a.d.value;
+             kx_int32_t rc = sec_release_acl(a.get());
+             EXPECT_TRUE(a.d.value == value && a.d.length == 71);
              return rc;
          }},
-        {"list_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl", 1, 0},
-         [](outputs &o) { return sec_list_acl(nullptr, &o.list); }},
-        {"list_acl: no list", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl", 2, 0},
-         [](outputs &) { return sec_list_acl(good.get(), nullptr); }},
-        {"list_acl: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
-         [](outputs &o) { return sec_list_acl(foreign.get(), &o.list); }},
-        {"list_acl: length without bytes", SEC_S_BAD_ACL, MSG_2650_109, {},
-         [](outputs &o) { return sec_list_acl(&no_value, &o.list); }},
-        {"list_acl_by_type: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 1, 0},
-         [](outputs &o) { return sec_list_acl_by_type(nullptr, 4, nullptr, &o.list); }},
-        {"list_acl_by_type: type 3", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 2, 3},
-         [](outputs &o) { return sec_list_acl_by_type(good.get(), 3, nullptr, &o.list); }},
-        {"list_acl_by_type: handler bit", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_list_acl_by_type", 2, 0x84},
-         [](outputs &o) { return sec_list_acl_by_type(good.get(), 0x84, nullptr, &o.list); }},
-        {"list_acl_by_type: empty mech", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_list_acl_by_type", 3, shown(nothing)},
-         [](outputs &o) { return sec_list_acl_by_type(good.get(), 4, nothing, &o.list); }},
-        {"list_acl_by_type: long mech", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_list_acl_by_type", 3, shown(long_mech)},
-         [](outputs &o) { return sec_list_acl_by_type(good.get(), 8, long_mech, &o.list); }},
-        {"list_acl_by_type: no list", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl_by_type", 4, 0},
-         [](outputs &) { return sec_list_acl_by_type(good.get(), 16, nullptr, nullptr); }},
-        {"list_acl_by_type: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
+        param("sec_list_acl", 1, 0, [](outputs &o) { return sec_list_acl(nullptr, &o.list); }),
+        param("sec_list_acl", 2, 0, [](outputs &) { return sec_list_acl(good.get(), nullptr); }),
+        {acl, MSG_2650_115, {}, [](outputs &o) { return sec_list_acl(foreign.get(), &o.list); }},
+        {acl, MSG_2650_109, {}, [](outputs &o) { return sec_list_acl(&no_value, &o.list); }},
+        param(by_type, 1, 0,
+         [](outputs &o) { return sec_list_acl_by_type(nullptr, 4, nullptr, &o.list); }),
+        param(by_type, 2, 3,
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 3, nullptr, &o.list); }),
+        param(by_type, 2, 0x84,
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 0x84, nullptr, &o.list); }),
+        param(by_type, 3, shown(nothing),
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 4, nothing, &o.list); }),
+        param(by_type, 3, shown(long_mech),
+         [](outputs &o) { return sec_list_acl_by_type(good.get(), 8, long_mech, &o.list); }),
+        param(by_type, 4, 0,
+         [](outputs &) { return sec_list_acl_by_type(good.get(), 16, nullptr, nullptr); }),
+        {acl, MSG_2650_115, {},
          [](outputs &o) { return sec_list_acl_by_type(foreign.get(), 4, nullptr, &o.list); }},
-        {"add_acle_to_acl: no entry", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_add_acle_to_acl", 1, 0},
-         [](outputs &) { return sec_add_acle_to_acl(nullptr, good.get()); }},
-        {"add_acle_to_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_add_acle_to_acl", 2, 0},
-         [](outputs &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), nullptr); }},
-        {"add_acle_to_acl2: no entry, same routine", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_add_acle_to_acl", 1, 0},
-         [](outputs &) { return sec_add_acle_to_acl2(nullptr, good.get()); }},
-        {"add_acle_to_acl: type 3", SEC_S_BAD_ACLE, MSG_2650_116, {3},
+        param(add, 1, 0, [](outputs &) { return sec_add_acle_to_acl(nullptr, good.get()); }),
+        param(add, 2, 0,
+         [](outputs &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), nullptr); }),
+        param(add, 1, 0,
+         [](outputs &) { return sec_add_acle_to_acl2(nullptr, good.get()); }), // the same routine
+        {acle, MSG_2650_116, {3},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {3, 1}, worked_example); }},
-        {"add_acle_to_acl: user without mech", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_USER},
+        {acle, MSG_2650_117, {4},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {4, 1, "", "bob"}, worked_example); }},
-        {"add_acle_to_acl2: mech filling its field", SEC_S_BAD_ACLE, MSG_2650_117,
-         {SEC_ACLE_EXPANDED},
-         [](outputs &) {
+        {acle, MSG_2650_117, {SEC_ACLE_EXPANDED}, [](outputs &) { // a mech filling its field
              entry e{SEC_ACLE_EXPANDED, 1, "", "x*"};
              std::memset(e.desc.mech, 'm', sizeof e.desc.mech);
              return edit_of(sec_add_acle_to_acl2, e, worked_example);
          }},
-        {"add_acle_to_acl: group without id", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_GROUP},
+        {acle, MSG_2650_117, {16},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {16, 1}, worked_example); }},
-        {"add_acle_to_acl: buffer type", SEC_S_BAD_ACL, MSG_2650_113, {},
+        {acl, MSG_2650_113, {},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, bad_type); }},
-        {"add_acle_to_acl: version", SEC_S_BAD_ACL, MSG_2650_114, {},
+        {acl, MSG_2650_114, {},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, bad_version); }},
-        {"add_acle_to_acl: other byte order", SEC_S_BAD_ACL, MSG_2650_115, {},
+        {acl, MSG_2650_115, {},
          [](outputs &) { return edit_of(sec_add_acle_to_acl, {2, 1}, worked_example_swapped); }},
-        {"add_acle_to_acl: length without bytes", SEC_S_BAD_ACL, MSG_2650_106, {},
+        {acl, MSG_2650_106, {},
          [](outputs &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), &no_value); }},
-        {"del_acle_from_acl: no entry", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_del_acle_from_acl", 1, 0},
-         [](outputs &) { return sec_del_acle_from_acl(nullptr, good.get()); }},
-        {"del_acle_from_acl: no ACL", SEC_S_BAD_PARAM, MSG_2650_101,
-         {"sec_del_acle_from_acl", 2, 0},
-         [](outputs &) { entry e{2, 1}; return sec_del_acle_from_acl(e.p(), nullptr); }},
-        {"del_acle_from_acl: type 32", SEC_S_BAD_ACLE, MSG_2650_116, {32},
+        param(del, 1, 0, [](outputs &) { return sec_del_acle_from_acl(nullptr, good.get()); }),
+        param(del, 2, 0,
+         [](outputs &) { entry e{2, 1}; return sec_del_acle_from_acl(e.p(), nullptr); }),
+        {acle, MSG_2650_116, {32},
          [](outputs &) { return edit_of(sec_del_acle_from_acl, {32, 1}, worked_example); }},
-        {"del_acle_from_acl: expanded, no id", SEC_S_BAD_ACLE, MSG_2650_117, {SEC_ACLE_EXPANDED},
+        {acle, MSG_2650_117, {8},
          [](outputs &) { return edit_of(sec_del_acle_from_acl, {8, 1, "unix"}, worked_example); }},
-        {"del_acle_from_acl: the empty ACL", SEC_S_BAD_ACL, MSG_2650_106, {},
+        {acl, MSG_2650_106, {},
          [](outputs &) { return edit_of(sec_del_acle_from_acl, {2, 1}, {}); }},
-        {"del_acle_from_acl: buffer type", SEC_S_BAD_ACL, MSG_2650_113, {},
+        {acl, MSG_2650_113, {},
          [](outputs &) { return edit_of(sec_del_acle_from_acl, {2, 1}, bad_type); }},
         // The ACL is left alone and the flags are handed back as they came.
-        {"read_acl_file: no file name", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 1, 0},
-         [](outputs &o) {
-             return sec_read_acl_file(nullptr, nullptr, nullptr, 0x105, &o.acl, &o.rflags);
-         },
+        {SEC_S_BAD_PARAM, MSG_2650_101, {read, 1, 0},
+         [](outputs &o) { return read_with(nullptr, nullptr, 0x105, &o.acl, o); },
          [](const outputs &o) { EXPECT_TRUE(o.rflags == 0x105 && o.acl.length == 7); }},
-        {"read_acl_file: no descriptor", SEC_S_BAD_PARAM, MSG_2650_101, {"sec_read_acl_file", 5, 0},
-         [](outputs &o) { return sec_read_acl_file("acl", nullptr, nullptr, 2, nullptr, &o.rflags);
-         },
+        {SEC_S_BAD_PARAM, MSG_2650_101, {read, 5, 0},
+         [](outputs &o) { return read_with("acl", nullptr, 2, nullptr, o); },
          [](const outputs &o) { EXPECT_EQ(o.rflags, 2u); }},
-        {"read_acl_file: empty user name", SEC_S_BAD_PARAM, MSG_2650_134, {},
-         [](outputs &o) { return sec_read_acl_file("acl", "", nullptr, 3, &o.acl, &o.rflags); },
+        {SEC_S_BAD_PARAM, MSG_2650_134, {},
+         [](outputs &o) { return read_with("acl", "", 3, &o.acl, o); },
          [](const outputs &o) { EXPECT_TRUE(o.rflags == 3 && o.acl.length == 7); }},
-        {"register_id_handler: type 0", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 1, 0},
-         [](outputs &) { return sec__register_id_handler(0, nullptr, nullptr); }},
-        {"register_id_handler: type 3", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 1, 3},
-         [](outputs &) { return sec__register_id_handler(3, "", never_called); }},
-        {"register_id_handler: no mech", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 2, 0},
-         [](outputs &) { return sec__register_id_handler(1, nullptr, nullptr); }},
-        {"register_id_handler: no handler", SEC_S_BAD_PARAM, MSG_2650_101, {reg, 3, 0},
-         [](outputs &) { return sec__register_id_handler(1, "", nullptr); }},
-        {"register_id_handler: long mech", SEC_S_BAD_PARAM, MSG_2650_132, {},
+        param(reg, 1, 0, [](outputs &) { return sec__register_id_handler(0, nullptr, nullptr); }),
+        param(reg, 1, 3, [](outputs &) { return sec__register_id_handler(3, "", never_called); }),
+        param(reg, 2, 0, [](outputs &) { return sec__register_id_handler(1, nullptr, nullptr); }),
+        param(reg, 3, 0, [](outputs &) { return sec__register_id_handler(1, "", nullptr); }),
+        {SEC_S_BAD_PARAM, MSG_2650_132, {},
          [](outputs &) { return sec__register_id_handler(2, long_mech, never_called); }},
-        {"register_id_handler: empty mech", SEC_S_BAD_PARAM, MSG_2650_132, {},
+        {SEC_S_BAD_PARAM, MSG_2650_132, {},
          [](outputs &) { return sec__register_id_handler(2, "", never_called); }},
-        {"single_acle_perm: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {one, 1, 0},
-         [](outputs &o) { return single(nullptr, 4, "unix", "bob", &o.perm); }},
-        {"single_acle_perm: no result", SEC_S_BAD_PARAM, MSG_2650_101, {one, 6, 0},
-         [](outputs &) { return single(good.get(), 16, nullptr, nullptr, nullptr); }},
-        {"group_acles_perm: no ACL", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 1, 0},
-         [](outputs &o) { return sec__group_acles_perm(nullptr, 0, nullptr, &o.perm); }},
-        {"group_acles_perm: no groups", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 3, 0},
-         [](outputs &o) { return sec__group_acles_perm(good.get(), 1, nullptr, &o.perm); }},
-        {"group_acles_perm: count -1", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 3, 0},
-         [](outputs &o) { return sec__group_acles_perm(good.get(), -1, nullptr, &o.perm); }},
-        {"group_acles_perm: no result", SEC_S_BAD_PARAM, MSG_2650_101, {groups, 4, 0},
-         [](outputs &) { return sec__group_acles_perm(good.get(), 0, nullptr, nullptr); }},
+        param(one, 1, 0, [](outputs &o) { return single(nullptr, 4, "unix", "bob", &o.perm); }),
+        param(one, 6, 0,
+         [](outputs &) { return single(good.get(), 16, nullptr, nullptr, nullptr); }),
+        param(groups, 1, 0,
+         [](outputs &o) { return sec__group_acles_perm(nullptr, 0, nullptr, &o.perm); }),
+        param(groups, 3, 0,
+         [](outputs &o) { return sec__group_acles_perm(good.get(), 1, nullptr, &o.perm); }),
+        param(groups, 3, 0,
+         [](outputs &o) { return sec__group_acles_perm(good.get(), -1, nullptr, &o.perm); }),
+        param(groups, 4, 0,
+         [](outputs &) { return sec__group_acles_perm(good.get(), 0, nullptr, nullptr); }),
     };
 
     // Header faults come before the other arguments in both evaluations (a
     // refused type, no groups) and refuse conversion too, except a cut
     // buffer and one of the other order, which convert without validation.
-    for (auto [acl, m, converts] : {std::tuple{&empty, MSG_2650_109, false},
+    for (auto [a, m, converts] : {std::tuple{&empty, MSG_2650_109, false},
                                     {&no_value, MSG_2650_109, false},
                                     {cut.get(), MSG_2650_109, true},
                                     {typeless.get(), MSG_2650_109, false},
                                     {unversioned.get(), MSG_2650_109, false},
                                     {foreign.get(), MSG_2650_115, true}}) {
-        rows.push_back({"single_acle_perm: header", SEC_S_BAD_ACL, m, {}, [acl](outputs &o) {
-                            return single(acl, 16, nullptr, nullptr, &o.perm);
-                        }});
-        rows.push_back({"group_acles_perm: header", SEC_S_BAD_ACL, m, {}, [acl](outputs &o) {
-                            return sec__group_acles_perm(acl, 0, nullptr, &o.perm);
-                        }});
+        rows.push_back({acl, m, {},
+                        [a](outputs &o) { return single(a, 16, nullptr, nullptr, &o.perm); }});
+        rows.push_back({acl, m, {},
+                        [a](outputs &o) { return sec__group_acles_perm(a, 0, nullptr, &o.perm); }});
         if (!converts)
-            rows.push_back({"convert_acl_to_host: header", SEC_S_BAD_ACL, MSG_2650_109, {},
-                            [acl](outputs &) { return sec_convert_acl_to_host(0, acl); }});
+            rows.push_back({acl, MSG_2650_109, {},
+                            [a](outputs &) { return sec_convert_acl_to_host(0, a); }});
     }
     // The type is shown as its whole byte; user and expanded requests need
     // a mechanism, then an identity.
     for (unsigned type : {0u, 3u, 16u, 0x90u, 0x9fu, 0xe0u})
-        rows.push_back({"single_acle_perm: type", SEC_S_BAD_PARAM, MSG_2650_128, {type},
-                        [type](outputs &o) {
+        rows.push_back({SEC_S_BAD_PARAM, MSG_2650_128, {type}, [type](outputs &o) {
                             auto t = static_cast<unsigned char>(type);
                             return single(good.get(), t, "unix", "bob", &o.perm);
                         }});
     for (unsigned char type : {4, 8, 0x84})
-        for (const char *none : {static_cast<const char *>(nullptr), ""}) {
-            rows.push_back({"single_acle_perm: mech", SEC_S_BAD_PARAM, MSG_2650_129, {},
-                            [=](outputs &o) {
-                                char *mech = const_cast<char *>(none);
-                                return sec__single_acle_perm(good.get(), type, mech, unix_mech,
+        for (char *none : {static_cast<char *>(nullptr), nothing}) {
+            rows.push_back({SEC_S_BAD_PARAM, MSG_2650_129, {}, [=](outputs &o) {
+                                return sec__single_acle_perm(good.get(), type, none, unix_mech,
                                                              nullptr, &o.perm);
                             }});
-            rows.push_back({"single_acle_perm: id", SEC_S_BAD_PARAM, MSG_2650_130, {},
+            rows.push_back({SEC_S_BAD_PARAM, MSG_2650_130, {},
                             [=](outputs &o) {
                                 return single(good.get(), type, "unix", none, &o.perm);
                             }});
@@ -342,8 +312,9 @@ std::vector<refusal> refusals() {
 }
 
 TEST(ApiTable, BadArguments) {
+    int row = 0;
     for (const refusal &r : refusals()) {
-        SCOPED_TRACE(r.call);
+        SCOPED_TRACE("row " + std::to_string(row++));
         outputs o;
         EXPECT_EQ(r.run(o), r.status);
         EXPECT_TRUE(record_is(r.status, r.msg, r.args));
@@ -380,21 +351,11 @@ struct expected {
 };
 
 // Trace items: numbers of 1 and 4 bytes, pointers, texts.
-std::string u8(std::uint8_t v) {
-    return hex_of(v);
-}
-std::string u32(kx_uint32_t v) {
-    return hex_of(v);
-}
-std::string i32(kx_int32_t v) {
-    return hex_of(v);
-}
-std::string ptr(const void *p) {
-    return hex_of(p);
-}
-std::string txt(const std::string &s) {
-    return hex_text(s);
-}
+const auto u8 = [](std::uint8_t v) { return hex_of(v); };
+const auto u32 = [](kx_uint32_t v) { return hex_of(v); };
+const auto i32 = [](kx_int32_t v) { return hex_of(v); };
+const auto ptr = [](const void *p) { return hex_of(p); };
+const auto txt = [](const std::string &s) { return hex_text(s); };
 
 // What the traced calls share; made before the first library call.
 struct world {
@@ -502,16 +463,13 @@ std::vector<traced_call> traced_calls() {
              sec_release_aclelist(w.list.get());
              return ok; }},
         {"sec_add_acle_to_acl", 60, 63, clears, [](world &w, expected &x) {
-             x.at(62, edit_items(w));
-             x.at(64, {i32(ok)});
+             x.at(62, edit_items(w)), x.at(64, {i32(ok)});
              return sec_add_acle_to_acl(w.carol.p(), w.acl.get()); }},
         {"sec_add_acle_to_acl2 refusing", 60, 63, clears, [](world &w, expected &x) {
-             x.at(62, edit_items(w));
-             x.at(64, {i32(SEC_S_BAD_ACLE)});
+             x.at(62, edit_items(w)), x.at(64, {i32(SEC_S_BAD_ACLE)});
              return sec_add_acle_to_acl2(w.carol.p(), w.acl.get()); }},
         {"sec_del_acle_from_acl", 65, 68, clears, [](world &w, expected &x) {
-             x.at(67, edit_items(w));
-             x.at(69, {i32(ok)});
+             x.at(67, edit_items(w)), x.at(69, {i32(ok)});
              return sec_del_acle_from_acl(w.carol.p(), w.acl.get()); }},
         {"sec__register_id_handler", 74, 77, clears, [](world &, expected &x) {
              sec_acl_id_handler h = handler;
@@ -543,13 +501,6 @@ std::vector<traced_call> traced_calls() {
              return sec_release_acl(w.acl.get()); }},
     };
     // clang-format on
-}
-
-std::vector<unsigned> ids_of(const std::vector<trace_record> &records) {
-    std::vector<unsigned> ids;
-    for (const trace_record &r : records)
-        ids.push_back(r.id);
-    return ids;
 }
 
 // Every traced call at API levels 8, 1, 4 and 0: at 8 the records with
@@ -606,41 +557,6 @@ TEST(ApiTrace, FailedRegistrationKeepsTheCallersRecord) {
     kx_uint32_t mask;
     EXPECT_EQ(sec_translate_perms("r", nullptr, &mask), SEC_S_OK);
     EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
-}
-
-// ---- the file reader's own points ------------------------------------------
-
-// Info 1: examining and opening, the cache written, an empty file, and a
-// CACL file of another mode with both owners and modes; Info 8 adds every
-// line consumed with its number, type, mechanism, identity and mask.
-TEST(FileTrace, InfoPoints) {
-    std::string trace = start_tracing("_SEL:Info=1");
-    acl_dir d("o r\n# c\ng staff rw\n");
-    ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
-    ASSERT_EQ(acl_read(d.acl, CACHE).status, SEC_S_OK);
-    auto records = read_trace(trace);
-    // Examine, absent, open the text, cache absent; examine, open the CACL file.
-    ASSERT_EQ(ids_of(records), (std::vector<unsigned>{117, 118, 121, 110, 117, 121}));
-    EXPECT_EQ(records[0].items, (std::vector<std::string>{hex_text(d.cacl)}));
-    EXPECT_EQ(records[1].items[1], i32(ENOENT));
-    EXPECT_EQ(records[2].items, (std::vector<std::string>{hex_text(d.acl)}));
-    EXPECT_EQ(records[5].items, (std::vector<std::string>{hex_text(d.cacl)}));
-
-    acl_dir empty("");
-    write_file(empty.cacl, "x", 0600);
-    ASSERT_EQ(acl_read(empty.acl, CACHE).status, SEC_S_OK);
-    acl_dir foreign;
-    write_file(foreign.cacl, "x", 0600);
-    ASSERT_EQ(acl_read(foreign.acl, 0).status, SEC_S_OK);
-    records = read_trace(trace);
-    ASSERT_GE(records.size(), 9u);
-    EXPECT_EQ(records[6].id, 116u); // the empty file; its CACL file is not looked at
-    EXPECT_EQ(records[6].items, (std::vector<std::string>{hex_text(empty.acl)}));
-    ASSERT_EQ(records[8].id, 120u);
-    ASSERT_EQ(records[8].items.size(), 7u);
-    EXPECT_EQ(records[8].items[0], hex_text(foreign.acl));
-    EXPECT_EQ(records[8].items[5], u32(S_IFREG | 0644));
-    EXPECT_EQ(records[8].items[6], u32(S_IFREG | 0600));
 }
 
 } // namespace
