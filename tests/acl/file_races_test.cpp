@@ -73,7 +73,8 @@ std::string users(int n) {
 constexpr std::size_t window = 64 * 1024;
 
 TEST(ReadAclFileText, AnyTextReadsAsItCompilesInMemory) {
-    const std::string long_line = "#" + std::string(1094, 'x') + '\n'; // 1096 bytes
+    const std::string long_line =
+        std::string(1, '#').append(1094, 'x').append(1, '\n'); // 1096 bytes
     const std::string texts[] = {
         "o r\nu unix bob rw", // the last line has no line end
         users(4000) + "g last r",

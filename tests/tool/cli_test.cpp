@@ -116,9 +116,11 @@ TEST(TemplateFile, ParsesTemplatesAndNamesBadLines) {
                                     name13 + " " + help63 + "\n",
                                 set, error))
         << error;
-    for (const auto &p : set.perms)
-        shown += p.printchar + (" " + std::to_string(p.code)) + " " + p.printstring + " [" +
-                 p.printhelp + "]\n";
+    for (const auto &p : set.perms) {
+        shown += p.printchar;
+        shown += ' ';
+        shown += std::to_string(p.code) + ' ' + p.printstring + " [" + p.printhelp + "]\n";
+    }
     EXPECT_EQ(shown, "r 1 read [Read the thing]\nW 2147483648 write []\nx 2 " + name13 + " [" +
                          help63 + "]\n");
     sec_perm_set_t lib = set.get();
