@@ -115,6 +115,8 @@ std::vector<refusal> refusals() {
     const kx_int32_t acl = SEC_S_BAD_ACL, acle = SEC_S_BAD_ACLE, perm = SEC_S_BAD_PERMISSION;
     auto nothing_out = [](const outputs &o) { EXPECT_TRUE(!o.mech && !o.id); };
     auto no_entry = [](const outputs &o) { EXPECT_EQ(o.acle, nullptr); };
+    static sec_acl_buffer_t g = good.get();
+    static unsigned char *we = data_of(worked_example);
 
     // clang-format off
     std::vector<refusal> rows = {
@@ -152,13 +154,12 @@ std::vector<refusal> refusals() {
         // Past the argument checks, a failure leaves both outputs null.
         {acle, MSG_2650_107, {7}, [](auto &o) { return display({7, 1}, o); }, nothing_out},
         {acle, MSG_2650_108, {}, [](auto &o) { return display({16, 1, "", ""}, o); }, nothing_out},
-        {acle, MSG_2650_108, {}, [](auto &o) { return display({4, 1, "", "joe"}, o); }, nothing_out},
+        {acle, MSG_2650_108, {},
+         [](auto &o) { return display({4, 1, "", "joe"}, o); }, nothing_out},
         param("sec_create_empty_acl", 1, 0, [](auto &) { return sec_create_empty_acl(nullptr); }),
-        param(from_data, 1, 0,
-         [](auto &o) { return sec_read_acl_from_data(0, data_of(worked_example), &o.acl); }),
+        param(from_data, 1, 0, [](auto &o) { return sec_read_acl_from_data(0, we, &o.acl); }),
         param(from_data, 2, 0, [](auto &o) { return sec_read_acl_from_data(5, nullptr, &o.acl); }),
-        param(from_data, 3, 0,
-         [](auto &) { return sec_read_acl_from_data(5, data_of(worked_example), nullptr); }),
+        param(from_data, 3, 0, [](auto &) { return sec_read_acl_from_data(5, we, nullptr); }),
         param("sec_convert_acl_to_host", 1, 0,
          [](auto &) { return sec_convert_acl_to_host(1, nullptr); }),
         // Bytes that are no ACL buffer are not freed (owned_acl frees them).
@@ -170,22 +171,20 @@ std::vector<refusal> refusals() {
              return rc;
          }},
         param("sec_list_acl", 1, 0, [](auto &o) { return sec_list_acl(nullptr, &o.list); }),
-        param("sec_list_acl", 2, 0, [](auto &) { return sec_list_acl(good.get(), nullptr); }),
+        param("sec_list_acl", 2, 0, [](auto &) { return sec_list_acl(g, nullptr); }),
         {acl, MSG_2650_115, {}, [](auto &o) { return sec_list_acl(foreign.get(), &o.list); }},
         {acl, MSG_2650_109, {}, [](auto &o) { return sec_list_acl(&no_value, &o.list); }},
         param(by_type, 1, 0,
          [](auto &o) { return sec_list_acl_by_type(nullptr, 4, nullptr, &o.list); }),
-        param(by_type, 2, 3,
-         [](auto &o) { return sec_list_acl_by_type(good.get(), 3, nullptr, &o.list); }),
+        param(by_type, 2, 3, [](auto &o) { return sec_list_acl_by_type(g, 3, nullptr, &o.list); }),
         param(by_type, 3, shown(nothing),
-         [](auto &o) { return sec_list_acl_by_type(good.get(), 4, nothing, &o.list); }),
+         [](auto &o) { return sec_list_acl_by_type(g, 4, nothing, &o.list); }),
         param(by_type, 3, shown(long_mech),
-         [](auto &o) { return sec_list_acl_by_type(good.get(), 8, long_mech, &o.list); }),
-        param(by_type, 4, 0,
-         [](auto &) { return sec_list_acl_by_type(good.get(), 16, nullptr, nullptr); }),
+         [](auto &o) { return sec_list_acl_by_type(g, 8, long_mech, &o.list); }),
+        param(by_type, 4, 0, [](auto &) { return sec_list_acl_by_type(g, 16, nullptr, nullptr); }),
         {acl, MSG_2650_115, {},
          [](auto &o) { return sec_list_acl_by_type(foreign.get(), 4, nullptr, &o.list); }},
-        param(add, 1, 0, [](auto &) { return sec_add_acle_to_acl(nullptr, good.get()); }),
+        param(add, 1, 0, [](auto &) { return sec_add_acle_to_acl(nullptr, g); }),
         param(add, 2, 0, [](auto &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), nullptr); }),
         // The entry checks, shared with deletion, come before the header's.
         {acle, MSG_2650_116, {3}, [](auto &) { return edit_of(add_fn, {3, 1}, bad_type); }},
@@ -203,7 +202,7 @@ std::vector<refusal> refusals() {
          [](auto &) { return edit_of(add_fn, {2, 1}, worked_example_swapped); }},
         {acl, MSG_2650_106, {},
          [](auto &) { entry e{2, 1}; return sec_add_acle_to_acl(e.p(), &no_value); }},
-        param(del, 1, 0, [](auto &) { return sec_del_acle_from_acl(nullptr, good.get()); }),
+        param(del, 1, 0, [](auto &) { return sec_del_acle_from_acl(nullptr, g); }),
         param(del, 2, 0,
          [](auto &) { entry e{2, 1}; return sec_del_acle_from_acl(e.p(), nullptr); }),
         {acle, MSG_2650_116, {32}, [](auto &) { return edit_of(del_fn, {32, 1}, {}); }},
@@ -226,15 +225,12 @@ std::vector<refusal> refusals() {
         {SEC_S_BAD_PARAM, MSG_2650_132, {},
          [](auto &) { return sec__register_id_handler(2, "", never_called); }},
         param(one, 1, 0, [](auto &o) { return single(nullptr, 4, "unix", "bob", &o.perm); }),
-        param(one, 6, 0, [](auto &) { return single(good.get(), 16, nullptr, nullptr, nullptr); }),
+        param(one, 6, 0, [](auto &) { return single(g, 16, nullptr, nullptr, nullptr); }),
         param(groups, 1, 0,
          [](auto &o) { return sec__group_acles_perm(nullptr, 0, nullptr, &o.perm); }),
-        param(groups, 3, 0,
-         [](auto &o) { return sec__group_acles_perm(good.get(), 1, nullptr, &o.perm); }),
-        param(groups, 3, 0,
-         [](auto &o) { return sec__group_acles_perm(good.get(), -1, nullptr, &o.perm); }),
-        param(groups, 4, 0,
-         [](auto &) { return sec__group_acles_perm(good.get(), 0, nullptr, nullptr); }),
+        param(groups, 3, 0, [](auto &o) { return sec__group_acles_perm(g, 1, nullptr, &o.perm); }),
+        param(groups, 3, 0, [](auto &o) { return sec__group_acles_perm(g, -1, nullptr, &o.perm); }),
+        param(groups, 4, 0, [](auto &) { return sec__group_acles_perm(g, 0, nullptr, nullptr); }),
     };
     // Header faults come before the other arguments in both evaluations (a
     // refused type, no groups) and refuse conversion too, except a cut

@@ -70,22 +70,6 @@ TEST(CheckAclBuffer, Faults) {
               SEC_S_OK);
 }
 
-TEST(FindSubacl, WorkedExampleOffsets) {
-    owned_acl acl(worked_example), header(empty_acl_bytes);
-    auto offset_of = [](owned_acl &in, unsigned char type, const char *mech) -> long {
-        unsigned char *found = nullptr;
-        EXPECT_EQ(sec__find_subacl(in.get(), type, mech, &found), SEC_S_OK);
-        return found ? found - static_cast<unsigned char *>(in.d.value) : -1;
-    };
-    EXPECT_EQ(offset_of(acl, 4, "UNIX"), 45);
-    EXPECT_EQ(offset_of(acl, 16, "ignored"), 22);
-    EXPECT_EQ(offset_of(acl, 2, nullptr), 5);
-    EXPECT_EQ(offset_of(acl, 1, nullptr), -1);
-    EXPECT_EQ(offset_of(acl, 4, "uni"), -1);
-    EXPECT_EQ(offset_of(acl, 8, "unix"), -1);
-    EXPECT_EQ(offset_of(header, 2, nullptr), -1);
-}
-
 // ---- every reader and editor against damaged buffers -----------------------
 
 // The exercise aborts on a broken promise: say which bytes it was given.
