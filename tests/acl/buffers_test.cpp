@@ -280,6 +280,15 @@ TEST(DelAcle, ByIdentityAndRefusals) {
     ASSERT_EQ(del(acl, {SEC_ACLE_ANYOTHER, 0}), SEC_S_OK);
     EXPECT_EQ(acl.contents(), empty_acl_bytes);
 
+    // Not the last of its sub-ACL's ascending entries; added back, the buffer
+    // is as it was.
+    const bytes rich = rich_acl();
+    owned_acl some(rich);
+    ASSERT_EQ(del(some, {SEC_ACLE_USER, 0, "UNIX", "ALICE@node1.cluster.example.com"}), SEC_S_OK);
+    EXPECT_LT(some.contents().size(), rich.size());
+    ASSERT_EQ(add(some, {SEC_ACLE_USER, 5, "unix", "Alice@node1.cluster.example.com"}), SEC_S_OK);
+    EXPECT_EQ(some.contents(), rich);
+
     owned_acl no_entries(make_acl({make_subacl(16, 0, {}, {})}));
     EXPECT_EQ(del(no_entries, {SEC_ACLE_GROUP, 0, "", "staff"}), SEC_S_BAD_ACLE);
     EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_118, {16, "", "staff"}));
