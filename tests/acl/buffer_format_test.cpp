@@ -70,6 +70,16 @@ TEST(CheckAclBuffer, Faults) {
               SEC_S_OK);
 }
 
+// The sub-ACL's address, or null when there is none.
+TEST(FindSubacl, AddressOrNull) {
+    owned_acl acl(worked_example);
+    unsigned char *found = nullptr;
+    EXPECT_EQ(sec__find_subacl(acl.get(), 4, "UNIX", &found), SEC_S_OK);
+    EXPECT_EQ(found - static_cast<unsigned char *>(acl.d.value), 45);
+    EXPECT_EQ(sec__find_subacl(acl.get(), 1, nullptr, &found), SEC_S_OK);
+    EXPECT_EQ(found, nullptr);
+}
+
 // ---- every reader and editor against damaged buffers -----------------------
 
 // The exercise aborts on a broken promise: say which bytes it was given.
