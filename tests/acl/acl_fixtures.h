@@ -1,6 +1,5 @@
-// Shared helpers of the ACL buffer tests: known buffers byte for byte,
-// hand-made buffer pieces, entries in test-owned storage, descriptors that
-// own exactly-sized copies.
+// Known ACL buffers, hand-made buffer pieces, entries and descriptors that
+// the tests own.
 #ifndef KXACL_TEST_ACL_FIXTURES_H
 #define KXACL_TEST_ACL_FIXTURES_H
 
@@ -47,14 +46,13 @@ inline const bytes worked_example_swapped = {
 
 inline const bytes empty_acl_bytes = {0x85, 1, 2, 0, 0};
 
-// Pieces of hand-made little-endian buffers. A text field with its NUL:
+// Pieces of little-endian buffers, sized whole before their parts are copied
+// in: gcc 12 at -O3 takes vector::insert on a short vector for a copy out of
+// bounds (-Warray-bounds). A text field with its NUL:
 inline bytes text_field(const char *s) {
     return bytes(s, s + std::strlen(s) + 1);
 }
 
-// The pieces are sized whole before their parts are copied in: gcc 12 at -O3
-// takes the reallocation of vector::insert on a short vector for a copy out
-// of bounds (-Warray-bounds).
 inline bytes make_record(kx_uint32_t perm, const bytes &id = {}, unsigned char version = 1) {
     bytes r(7 + id.size(), 0);
     r[0] = version;
@@ -81,7 +79,6 @@ inline bytes make_subacl(unsigned char type, std::uint32_t count, const bytes &m
     return s;
 }
 
-// Sized whole before the sub-ACLs are copied in, as the pieces above are.
 inline bytes make_acl(std::initializer_list<bytes> subacls) {
     std::size_t size = 5;
     for (const bytes &s : subacls)
@@ -141,8 +138,7 @@ struct owned_list {
     owned_list(const owned_list &) = delete;
     ~owned_list() { sec_release_aclelist(&l); }
     sec_acle_list_t get() { return &l; }
-    // "type mech id perm" of each entry.
-    texts described() const {
+    texts described() const { // "type mech id perm" of each entry
         texts out;
         for (kx_int32_t i = 0; i < l.count; ++i) {
             const sec_acle_desc &a = *l.acles[i];
@@ -205,6 +201,33 @@ inline bytes swapped_order(bytes b) {
         at = next;
     }
     return b;
+}
+
+// Calls that both allocation failure tests make, through fail(n, call) which
+// fails their allocations at its level; each checks what a failure leaves.
+// A user whose host part is normalised:
+template <typename Fail> kx_int32_t create_failing(Fail fail, long n) {
+    sec_acle_t made = reinterpret_cast<sec_acle_t>(1);
+    kx_int32_t rc = fail(
+        n, [&] { return sec_create_acle(SEC_ACLE_USER, 3, "unix", "bob@0:0:0:0:0:0:0:1", &made); });
+    if (rc == SEC_S_OK)
+        EXPECT_STREQ(made->id, "bob@::1");
+    else
+        EXPECT_EQ(made, nullptr);
+    sec_release_acle(rc == SEC_S_OK ? made : nullptr);
+    return rc;
+}
+
+// A listing of rich_acl() of one type, or all (0), fails with an empty list.
+template <typename Fail> kx_int32_t list_failing(Fail fail, long n, unsigned char type) {
+    owned_acl acl(rich_acl());
+    owned_list list;
+    kx_int32_t rc = fail(n, [&] {
+        return type ? sec_list_acl_by_type(acl.get(), type, nullptr, list.get())
+                    : sec_list_acl(acl.get(), list.get());
+    });
+    EXPECT_TRUE(rc == SEC_S_OK || (list.l.count == 0 && !list.l.acles));
+    return rc;
 }
 
 // Expects the thread's error record to hold message msg with status.

@@ -1,8 +1,6 @@
 // ACL buffers through the exported functions: the empty ACL, copies of a
 // caller's bytes, conversion, release, listing and editing. Argument
 // refusals are in api_table_test, allocation failures in api_alloc_failure_test.
-#include <cctype>
-
 #include <gtest/gtest.h>
 
 #include "acl_fixtures.h"
@@ -42,9 +40,8 @@ TEST(AclLifecycle, CreateAndRelease) {
 // start passes 2650-109. A buffer of the other order is converted whatever
 // its mark; only one in host order is validated.
 TEST(ConvertAclToHost, Outcomes) {
-    bytes mark_0 = worked_example_swapped, mark_ff = worked_example_swapped;
+    bytes mark_0 = worked_example_swapped;
     mark_0[2] = 0;
-    mark_ff[2] = 0xff;
     bytes bad_version = worked_example_swapped, converted = worked_example;
     bad_version[60] = 7; // the ACLE version of bob's record
     converted[60] = 7;
@@ -58,13 +55,11 @@ TEST(ConvertAclToHost, Outcomes) {
         bytes out;
     } cases[] = {
         {empty_acl_bytes, 1, SEC_S_OK, 0, {}, empty_acl_bytes},
-        {{'a', 'b', 'c'}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
         {{0x85, 2, 2}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
         {{1, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
         {{0x85, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_119, {3}, {}},
         {worked_example_swapped, 0, SEC_S_OK, 0, {}, worked_example},
         {mark_0, 0, SEC_S_OK, 0, {}, worked_example},
-        {mark_ff, 0, SEC_S_OK, 0, {}, worked_example},
         {swapped_order(rich), 1, SEC_S_OK, 0, {}, rich},
         {bad_version, 1, SEC_S_OK, 0, {}, converted},
         {converted, 1, SEC_S_BAD_ACLE, MSG_2650_125, {7}, {}},
@@ -147,9 +142,7 @@ TEST(ListAcl, OrderSpellingAndRefusals) {
         {"users of every mech", rich, SEC_ACLE_USER, nullptr, SEC_S_OK, 0, users},
         {"unauthenticated, any mech", rich, 1, "a-mechanism-of-20-ch", SEC_S_OK, 0, {"1  - 1"}},
         {"no expanded krb5", rich, SEC_ACLE_EXPANDED, "krb5", SEC_S_OK, 0, {}},
-        {"no unauthenticated", worked_example, 1, nullptr, SEC_S_OK, 0, {}},
         {"the empty ACL", {}, 0, nullptr, SEC_S_OK, 0, {}},
-        {"the empty ACL's groups", {}, SEC_ACLE_GROUP, nullptr, SEC_S_OK, 0, {}},
         {"no sub-ACLs", empty_acl_bytes, 0, nullptr, SEC_S_OK, 0, {}},
         {"no sub-ACLs' groups", empty_acl_bytes, SEC_ACLE_GROUP, nullptr, SEC_S_OK, 0, {}},
         // Neither the mechanism's case nor non-UTF-8 bytes are touched.
@@ -168,7 +161,6 @@ TEST(ListAcl, OrderSpellingAndRefusals) {
                    make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}, -7)}),
          0, nullptr, SEC_S_OK, 0, {"2  - 1", "16  staff 1"}},
         {"sub-ACL of length 0", zero_length_subacl(), 0, nullptr, bad, MSG_2650_110, {}},
-        {"sub-ACL of length 0, by type", zero_length_subacl(), 4, nullptr, bad, MSG_2650_110, {}},
         {"sub-ACL shorter than its header", too_short, 0, nullptr, bad, MSG_2650_110, {}},
         {"anyother of two records",
          make_acl({make_subacl(2, 2, {}, {make_record(1), make_record(2)})}),
@@ -286,40 +278,18 @@ TEST(DelAcle, ByIdentityAndRefusals) {
     ASSERT_EQ(del(acl, {SEC_ACLE_ANYOTHER, 0}), SEC_S_OK);
     EXPECT_EQ(acl.contents(), empty_acl_bytes);
 
+    // Not the last of its sub-ACL's ascending entries; added back, the buffer
+    // is as it was.
+    const bytes rich = rich_acl();
+    owned_acl some(rich);
+    ASSERT_EQ(del(some, {SEC_ACLE_USER, 0, "UNIX", "ALICE@node1.cluster.example.com"}), SEC_S_OK);
+    EXPECT_LT(some.contents().size(), rich.size());
+    ASSERT_EQ(add(some, {SEC_ACLE_USER, 5, "unix", "Alice@node1.cluster.example.com"}), SEC_S_OK);
+    EXPECT_EQ(some.contents(), rich);
+
     owned_acl no_entries(make_acl({make_subacl(16, 0, {}, {})}));
     EXPECT_EQ(del(no_entries, {SEC_ACLE_GROUP, 0, "", "staff"}), SEC_S_BAD_ACLE);
     EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_118, {16, "", "staff"}));
-}
-
-// Adding an identity that the ACL lacks and deleting it again gives back
-// the same bytes, whether its sub-ACL existed or the add made it.
-TEST(EditRoundTrip, AddThenDeleteRestoresTheBuffer) {
-    bytes rich = rich_acl();
-    struct {
-        const bytes &base;
-        entry added;
-    } cases[] = {
-        {worked_example, {SEC_ACLE_USER, 1, "unix", "Aaron"}},
-        {worked_example, {SEC_ACLE_USER, 1, "krb5", "bob"}},
-        {worked_example, {SEC_ACLE_EXPANDED, 1, "unix", "x*"}},
-        {worked_example, {SEC_ACLE_GROUP, 1, "", "wheel"}},
-        {rich, {SEC_ACLE_EXPANDED, 1, "UNIX", "q*"}},
-        {rich, {SEC_ACLE_USER, 1, "unix", "brian@node1.cluster.example.com"}},
-        {rich, {SEC_ACLE_GROUP, 1, "", "adm"}},
-        {empty_acl_bytes, {SEC_ACLE_GROUP, 1, "", "wheel"}},
-    };
-    for (auto &c : cases) {
-        SCOPED_TRACE(c.added.id);
-        owned_acl acl(c.base);
-        ASSERT_EQ(add_only(acl, c.added), SEC_S_OK);
-        EXPECT_GT(acl.contents().size(), c.base.size());
-        entry removed = c.added;
-        for (char &ch : removed.id)
-            ch = static_cast<char>(std::toupper(static_cast<unsigned char>(ch)));
-        removed.desc.perm = 0xdead;
-        ASSERT_EQ(del(acl, removed), SEC_S_OK);
-        EXPECT_EQ(acl.contents(), c.base);
-    }
 }
 
 } // namespace

@@ -87,7 +87,6 @@ TEST(DumpAcl, LinesAndFailuresOfWholeBuffers) {
              "\t\ttype = n; permission = \n",
          ""},
         {{0x85, 1, 2, 0, 0}, descriptor(5, 0), ""},
-        {{0x84, 1, 2, 0, 0}, not_valid, ""},
         {{0x84}, not_valid, ""},
         {admin_acl(2), descriptor(34, 2) + subacl("\t", 29, 4, "unix", 1) + "\t\t" + admin_line,
          "2650-110"},

@@ -12,31 +12,27 @@
 
 using namespace kxacl;
 
-TEST(MessageTable, FixedEntries) {
+// Entries of other components are empty, never null; the numbered messages
+// stand at their catalogue indices: 2650-101 at 88 up to 2650-158 at 145,
+// then 2650-165 at 151 onwards.
+TEST(MessageTable, FixedEntriesAndNumberedMessages) {
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[0], "Reserved: DO NOT USE!");
     EXPECT_EQ(std::strlen(cu_badid_kxseclib_msg) + 1, 44u);
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[82], "The ACL provided is not valid!\n");
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[87], "%1$stype = %2$c; permission = %3$s\n");
-    // Entries of other components are empty, never null.
     for (int i = 0; i < KXSECLIB_MSG_COUNT; ++i)
         ASSERT_NE(cu_mesgtbl_kxseclib_msg[i], nullptr) << i;
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[90], "");
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[622], "");
-}
-
-// The numbered messages stand at their catalogue indices: 2650-101 at 88
-// up to 2650-158 at 145, then 2650-165 at 151 onwards.
-TEST(MessageTable, NumberedMessagesStandAtTheirIndex) {
     int filled = 0;
     for (int i = 88; i <= 166; ++i) {
-        const char *text = cu_mesgtbl_kxseclib_msg[i];
-        if (!*text)
+        const std::string text = cu_mesgtbl_kxseclib_msg[i];
+        if (text.empty())
             continue;
         ++filled;
-        int number = i <= 145 ? i + 13 : i + 14;
-        std::string prefix = "2650-" + std::to_string(number) + " ";
-        EXPECT_EQ(std::string(text).substr(0, prefix.size()), prefix) << i;
-        EXPECT_EQ(text[std::strlen(text) - 1], '\n') << i;
+        std::string prefix = "2650-" + std::to_string(i <= 145 ? i + 13 : i + 14) + " ";
+        EXPECT_EQ(text.substr(0, prefix.size()), prefix) << i;
+        EXPECT_EQ(text.back(), '\n') << i;
     }
     EXPECT_EQ(filled, 61);
 }
@@ -57,35 +53,31 @@ TEST(MessageTable, PlaceholderCounts) {
     EXPECT_EQ(placeholder_kind(message_text(MSG_2650_127), 2), arg_kind::text);
 }
 
+// The record as the catalogue expects it; a pointer shows as its low 32
+// bits, a skipped placeholder gets 0 and the position follows, and huge
+// byte counts do not wrap.
 TEST(Report, FillsTheRecordAsTheCatalogueExpects) {
     int x = 0;
     EXPECT_EQ(bad_param("sec_list_acl", 2, static_cast<void *>(nullptr)), SEC_S_BAD_PARAM);
     EXPECT_TRUE(kxtest::record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"sec_list_acl", 2, 0}));
     auto e = kxtest::last_error();
-    EXPECT_EQ(e.catalogue, "kxseclib.cat");
-    EXPECT_EQ(e.set, 1);
-    EXPECT_EQ(e.msg_num, 88);
+    EXPECT_TRUE(e.catalogue == "kxseclib.cat" && e.set == 1 && e.msg_num == 88);
     const std::string expected = "2650-101 Failure: incorrect parameters provided.\n"
                                  "\tFunction name: sec_list_acl\n"
                                  "\tPositional parameter number: 2\n\tParameter value: 0x0\n"
                                  "If this failure ";
     EXPECT_EQ(e.text.substr(0, expected.size()), expected);
-    // A pointer shows as its low 32 bits.
     bad_param("sec_list_acl", 1, &x);
     EXPECT_EQ(static_cast<unsigned>(kxtest::last_error().num(2)), pointer_value(&x));
-}
 
-TEST(Report, SkippedPlaceholderGetsZeroAndPositionFollows) {
     source_pos pos = here(src_acl);
     report<MSG_2650_127>(SEC_S_BAD_ACLE, 0, pos.file, pos.line);
     EXPECT_TRUE(kxtest::record_is(SEC_S_BAD_ACLE, MSG_2650_127, {0, "kxacl_acl", pos.line}));
-    auto e = kxtest::last_error();
+    e = kxtest::last_error();
     EXPECT_EQ(e.msg_num, 114);
     EXPECT_NE(e.text.find("(File name: kxacl_acl; line number: " + std::to_string(pos.line) + ")"),
               std::string::npos);
-}
 
-TEST(Report, HugeByteCountsDoNotWrap) {
     no_memory("sec_read_acl_file", std::size_t{1} << 40);
     EXPECT_TRUE(
         kxtest::record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"sec_read_acl_file", 2147483647}));

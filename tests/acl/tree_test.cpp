@@ -59,15 +59,10 @@ TEST(Acltree, IdentitiesSharingTheirFirstEightBytes) {
 // One tree per key in order of first occurrence; the worked example and the
 // ACL of no trees, byte for byte.
 TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
-    owned_trees trees;
-    ASSERT_EQ(trees.add({SEC_ACLE_USER, 3, "unix", "bob"}), SEC_S_OK);
-    ASSERT_EQ(trees.add({SEC_ACLE_GROUP, 1, "", "staff"}), SEC_S_OK);
-    ASSERT_EQ(trees.add({SEC_ACLE_USER, 1, "UNIX", "alice"}), SEC_S_OK);
-    ASSERT_EQ(trees.add({SEC_ACLE_ANYOTHER, 1}), SEC_S_OK);
-    ASSERT_EQ(trees.count, 3);
-    owned_acl acl;
-    ASSERT_EQ(sec__acltrees_to_acl(trees.trees, trees.count, acl.get()), SEC_S_OK);
-    EXPECT_EQ(acl.contents(),
+    EXPECT_EQ(build_acl({{SEC_ACLE_USER, 3, "unix", "bob"},
+                         {SEC_ACLE_GROUP, 1, "", "staff"},
+                         {SEC_ACLE_USER, 1, "UNIX", "alice"},
+                         {SEC_ACLE_ANYOTHER, 1}}),
               make_acl({make_subacl(2, 1, {}, {make_record(1)}),
                         make_subacl(16, 1, {}, {make_record(1, text_field("staff"))}),
                         make_subacl(4, 2, text_field("unix"),
