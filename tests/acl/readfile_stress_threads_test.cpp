@@ -3,11 +3,7 @@
 // iteration counts, not time; meant for ThreadSanitizer as well as plain runs.
 #include <atomic>
 #include <cstdio>
-#include <string>
 #include <thread>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "file_helpers.h"
 #include "messages.h"
@@ -19,8 +15,8 @@ namespace {
 const char text_a[] = "u unix bob rw\ng staff r\no r\n";
 const char text_b[] = "u unix bob rcx\ng staff w\ng wheel r\n";
 
-// Runs reader(i) for i up to reads on three threads, and work() on a
-// fourth; the readers' first failure, or "".
+// reader(i) for i up to reads on three threads, work() on a fourth; the
+// readers' first failure, or "".
 template <typename Reader, typename Work>
 std::string run_threads(int reads, Reader reader, Work work, std::atomic<bool> &readers_done) {
     std::atomic<int> failures{0}, left{3};
