@@ -1,7 +1,5 @@
-// Reading ACL files against a local user who races the reader: the text cut
-// short, the name given to another file between the reader's own steps, a
-// terminal swapped in; and texts of any size, which are read through a
-// window of whole lines.
+// Texts of any size, read through a window of whole lines; and a local user
+// racing the reader: text cut short, name flipped between steps, terminal.
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>

@@ -1,6 +1,5 @@
-// Stress: threads read an ACL file through its CACL file while it is
-// replaced, or while its name flips between two owners' files. Bounded by
-// iteration counts, not time; meant for ThreadSanitizer as well as plain runs.
+// Threads read an ACL file while it is replaced, or while its name flips
+// between two owners' files. Bounded by counts, not time; also for TSan.
 #include <atomic>
 #include <cstdio>
 #include <thread>

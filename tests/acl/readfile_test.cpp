@@ -1,6 +1,5 @@
-// sec_read_acl_file: where it looks for the ACL file, what each ACL file and
-// CACL file comes to, the CACL file it writes, owner rules with a user
-// name, the longest cached path, allocation failures and trace points.
+// sec_read_acl_file: the names it builds, what each ACL and CACL file comes
+// to, owner rules with a user name, allocation failures and trace points.
 #include <cerrno>
 #include <cstdio>
 #include <filesystem>
@@ -294,7 +293,7 @@ TEST(ReadAclFile, UsersFileRules) {
     }
 }
 
-TEST(ReadAclFile, EveryAllocationFailureOnTheCompilePathIsReported) {
+TEST(ReadAclFile, EveryAllocationFailureIsReported) {
     acl_dir d("u unix bob rw\nu unix ann r\ng staff r\ng wheel rw\no r\ne krb x@Y w\n");
     const std::string text = read_file(d.acl), expected = compiled(text);
     int failures = 0;
@@ -320,17 +319,15 @@ TEST(ReadAclFile, EveryAllocationFailureOnTheCompilePathIsReported) {
         EXPECT_EQ(dir_entries(d.dir), (std::vector<std::string>{"acl"}));
     }
     EXPECT_GE(failures, 8) << "the file, the trees, their entries and the buffer";
-}
 
-// The work buffer of the user lookup: twice the recommended size.
-TEST(ReadAclFile, NoMemoryForTheUserLookup) {
-    long recommended = sysconf(_SC_GETPW_R_SIZE_MAX);
-    long long expected = 2 * (recommended > 0 ? recommended : 16384);
+    // The work buffer of the user lookup: twice the recommended size.
+    const long long recommended = sysconf(_SC_GETPW_R_SIZE_MAX);
     mem_fail_after(0);
     acl_read r("acl", CACHE, "root");
     mem_fail_after(-1);
     EXPECT_EQ(r.status, SEC_S_NO_MEMORY);
-    EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102, {"sec__get_user_info", expected}));
+    EXPECT_TRUE(record_is(SEC_S_NO_MEMORY, MSG_2650_102,
+                          {"sec__get_user_info", 2 * (recommended > 0 ? recommended : 16384)}));
     EXPECT_TRUE(r.empty());
 }
 

@@ -154,7 +154,7 @@ const fault_rows compile_and_cache = {
 // fstat only means compiling, and its descriptor is closed again. Any
 // failure on the way to a current CACL file falls back to the text, which
 // compiles to the same bytes; the CACL file, being newer, stays.
-TEST(SyscallFailure, EachCallOnEachPath) {
+TEST(SyscallFailure, EachCallFailingOrMovingHalfTheBytes) {
     fault_rows stale = compile_and_cache;
     stale[sys_call::fstat].insert(stale[sys_call::fstat].begin(), text_cached);
     stale[sys_call::close].insert(stale[sys_call::close].begin(), text_cached);
@@ -174,11 +174,9 @@ TEST(SyscallFailure, EachCallOnEachPath) {
     // clang-format on
     for (const read_path &path : paths)
         fail_each_call(path);
-}
 
-// A read or a write that moves half the bytes: the read fails showing the
-// bytes it got; the write leaves the read uncached.
-TEST(SyscallFailure, ShortReadAndShortWrite) {
+    // A read or a write that moves half the bytes: the read fails showing
+    // the bytes it got; the write leaves the read uncached.
     prepared p(cacl_before::absent);
     const outcome half_read = fails(SEC_S_FILE_ERROR, MSG_2650_139, {text_size / 2, text_size, 0});
     EXPECT_TRUE(read_failing(p, p.d.acl, CACHE, sys_call::read, 0, 0, &half_read, p.d.dir));
