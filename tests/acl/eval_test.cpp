@@ -116,7 +116,7 @@ std::vector<request> requests() {
         {ids, 4, "unix", {}, "administratorz", {}, no, 0, "administratorz"},
         {ids, 4, "unix", {}, "administrato", {}, no, 0, "administrato"}, {ids, 4, "unix", {}, "bob", {}, ok, 0x4},
         {ids, 4, "unix", {}, "Operator@Node1.Cluster", {}, ok, 0x8}, {ids, 4, "unix", {}, "ZZ", {}, ok, 0x10},
-        {ids, 4, "unix", {}, "zzz", {}, no, 0, "zzz"},
+        {ids, 4, "unix", {}, "zzz", {}, no, 0, "zzz"}, {ids, 4, "unix", {}, "bobs", {}, no, 0, "bobs"},
         {unordered, 4, "unix", {}, "carol", {}, ok, 0x1}, {unordered, 4, "unix", {}, "alice", {}, no, 0, "alice"},
         // Only A to Z fold: other letters' bytes compare as they are.
         {accented, 4, "unix", {}, "\xc3\x89MILE", {}, no, 0, "\xc3\x89MILE"},
