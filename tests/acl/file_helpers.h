@@ -3,18 +3,12 @@
 #ifndef KXACL_TEST_FILE_HELPERS_H
 #define KXACL_TEST_FILE_HELPERS_H
 
-#include <algorithm>
-#include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
 #include <functional>
-#include <string>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <variant>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "acl_fixtures.h"
 #include "syscalls.h"
@@ -49,8 +43,7 @@ inline struct stat status_of(const std::string &path) {
 
 // Moves the file's modification time by delta seconds.
 inline void shift_mtime(const std::string &path, long delta) {
-    struct stat st = status_of(path);
-    timespec times[2] = {st.st_atim, st.st_mtim};
+    timespec times[2] = {{0, UTIME_OMIT}, status_of(path).st_mtim};
     times[1].tv_sec += delta;
     ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;
 }
@@ -76,24 +69,13 @@ inline std::vector<std::string> dir_entries(const std::string &dir) {
     return names;
 }
 
-// Message arguments in which a text starting with "$" stands for dir
-// followed by the rest of the text.
+// Message arguments with a leading "$" of a text standing for dir.
 inline std::vector<arg> in_dir(const std::string &dir, std::vector<arg> args) {
     for (arg &a : args)
         if (auto *s = std::get_if<std::string>(&a); s && !s->empty() && (*s)[0] == '$')
             *s = dir + s->substr(1);
     return args;
 }
-
-// Removes a directory and the files (not subdirectories) in it.
-struct removed_at_end {
-    std::string dir;
-    ~removed_at_end() {
-        for (const auto &name : dir_entries(dir))
-            unlink((dir + "/" + name).c_str());
-        rmdir(dir.c_str());
-    }
-};
 
 // A path of exactly length characters under base, whose directories are
 // made; the last component (the file) is not.
@@ -106,8 +88,7 @@ inline std::string path_of_length(const std::string &base, std::size_t length) {
     return p + "/" + std::string(length - p.size() - 1, 'f');
 }
 
-// The ACL compiled from example_text, the worked example: the sub-ACLs
-// stand in the reverse order of their first lines.
+// The ACL compiled from example_text.
 inline std::string example_acl() {
     return std::string(worked_example.begin(), worked_example.end());
 }
@@ -115,8 +96,7 @@ inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
 
 constexpr kx_uint32_t TEXT = SEC_F_ACL_TEXT, CACHE = SEC_F_ACL_CACHE, CONVERT = SEC_F_ACL_CONVERT;
 
-// One call of sec_read_acl_file; the buffer is released with the object.
-// Members in this order: the status is computed once the outputs exist.
+// One call of sec_read_acl_file; the status is computed once the outputs exist.
 struct acl_read {
     sec_buffer_s acl{0, nullptr};
     kx_uint32_t rflags = 0xdeadbeef; // until the call sets it
@@ -160,9 +140,8 @@ inline std::string compiled(const std::string &text) {
     return acl_read(d.acl, SEC_F_ACL_TEXT).bytes();
 }
 
-// A user made for one test with useradd, removed again with userdel. The
-// password files are locked while another useradd runs: commands are tried
-// again for up to 5 seconds.
+// A user made for one test. The password files are locked while another
+// useradd runs: commands are tried again for up to 5 seconds.
 struct scoped_user {
     static inline int made = 0;
     std::string name = "kxt" + std::to_string(getpid()) + "x" + std::to_string(made++);

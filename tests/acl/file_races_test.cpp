@@ -1,23 +1,13 @@
-// Reading ACL files against a local user who races the reader: the text cut
-// short, the name given to another file between the reader's own steps, a
-// terminal swapped in; and texts of any size, which are read through a
-// window of whole lines.
+// Texts of any size, read through a window of whole lines; and a local user
+// racing the reader: text cut short, name flipped between steps, terminal.
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
-#include <cstdlib>
-#include <functional>
-#include <string>
 #include <sys/wait.h>
 #include <tuple>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "file_helpers.h"
-#include "messages.h"
 #include "parse.h"
-#include "tree.h"
 
 using namespace kxacl;
 using namespace kxtest;
@@ -25,11 +15,10 @@ using namespace std::string_literals;
 
 namespace {
 
-// What a text comes to: the status, the message (with its line) and the bytes.
+// The status, the message (with its line) and the bytes.
 using compiled_text = std::tuple<kx_int32_t, std::string, std::string>;
 
-// Compiles the whole text held in memory, line by line: the reference for
-// the same text read from a file.
+// The reference: the whole text compiled in memory, line by line.
 compiled_text compile_in_memory(std::string text) {
     text.push_back('\0');
     char *cursor = text.data();
@@ -55,7 +44,7 @@ compiled_text compile_file(const std::string &text) {
     return {r.status, r.status == 0 ? "" : last_error().text, r.bytes()};
 }
 
-// Comment lines of exactly n bytes in all (n >= 2).
+// Comment lines of n bytes in all (n >= 2).
 std::string padding(std::size_t n) {
     std::string pad;
     while (n - pad.size() > 1000)
@@ -108,18 +97,15 @@ TEST(ReadAclFileRaces, TextCutShortBetweenReads) {
     EXPECT_EQ(r.status, SEC_S_FILE_ERROR);
     EXPECT_TRUE(record_is(SEC_S_FILE_ERROR, MSG_2650_139, {65536, 70000, 0}));
     EXPECT_TRUE(r.empty());
-    std::vector<std::vector<std::string>> short_reads;
-    for (const auto &rec : read_trace(trace))
-        if (rec.id == 127)
-            short_reads.push_back(rec.items);
-    EXPECT_EQ(short_reads,
-              (std::vector<std::vector<std::string>>{
-                  {hex_text(d.acl), hex_of(std::uint64_t{70000}), hex_of(std::int64_t{65536})}}));
+    auto records = read_trace(trace);
+    ASSERT_EQ(trace_ids(trace), (std::vector<unsigned>{121, 127}));
+    EXPECT_EQ(records[1].items,
+              (std::vector<std::string>{hex_text(d.acl), hex_of(std::uint64_t{70000}),
+                                        hex_of(std::int64_t{65536})}));
 }
 
-// Two ACL files of different owners and modes, "mine", root's, and
-// "theirs", daemon's (uid and gid 1); the reader reads the name "acl",
-// which starts as another name of "mine".
+// "mine", root's, and "theirs", daemon's (uid and gid 1), of other modes;
+// the name "acl" read starts as another name of "mine".
 struct two_owners {
     acl_dir d{"o r\n", 0644};
     std::string mine = d.dir + "/mine", theirs = d.dir + "/theirs";
@@ -142,8 +128,7 @@ struct two_owners {
         ASSERT_EQ(made, 0) << what;
         ASSERT_EQ(rename(staged.c_str(), d.acl.c_str()), 0);
     }
-    // A CACL file left behind holds the bytes compiled from the very file
-    // whose owner, group and mode it carries.
+    // A CACL file left holds the bytes of the file whose owner and mode it carries.
     void expect_honest_cacl() const {
         if (read_file(d.cacl) == "<missing>")
             return;
@@ -155,8 +140,7 @@ struct two_owners {
     }
 };
 
-// One swap of the name, just before the reader's call of a kind numbered
-// nth (counted from the previous swap).
+// A swap just before the call of a kind numbered nth after the previous swap.
 struct swap_step {
     sys_call call;
     long nth;

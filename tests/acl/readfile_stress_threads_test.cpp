@@ -1,13 +1,8 @@
-// Stress: threads read an ACL file through its CACL file while it is
-// replaced, or while its name flips between two owners' files. Bounded by
-// iteration counts, not time; meant for ThreadSanitizer as well as plain runs.
+// Threads read an ACL file while it is replaced, or while its name flips
+// between two owners' files. Bounded by counts, not time; also for TSan.
 #include <atomic>
 #include <cstdio>
-#include <string>
 #include <thread>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "file_helpers.h"
 #include "messages.h"
@@ -19,8 +14,8 @@ namespace {
 const char text_a[] = "u unix bob rw\ng staff r\no r\n";
 const char text_b[] = "u unix bob rcx\ng staff w\ng wheel r\n";
 
-// Runs reader(i) for i up to reads on three threads, and work() on a
-// fourth; the readers' first failure, or "".
+// reader(i) for i up to reads on three threads, work() on a fourth; the
+// readers' first failure, or "".
 template <typename Reader, typename Work>
 std::string run_threads(int reads, Reader reader, Work work, std::atomic<bool> &readers_done) {
     std::atomic<int> failures{0}, left{3};

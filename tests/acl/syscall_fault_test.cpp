@@ -6,14 +6,8 @@
 #include <cstring>
 #include <filesystem>
 #include <map>
-#include <string>
-#include <vector>
-
-#include <gtest/gtest.h>
 
 #include "file_helpers.h"
-#include "messages.h"
-#include "syscalls.h"
 
 using namespace kxacl;
 using namespace kxtest;
@@ -22,9 +16,7 @@ namespace {
 
 constexpr int injected = EIO;
 
-// What a read comes to when one system call fails: a failure with its
-// status, message and arguments ("$" starts the directory), or success
-// with these rflags.
+// A failure with its record ("$" starts the directory), or success with rflags.
 struct outcome {
     kx_int32_t status, msg;
     kx_uint32_t rflags;
@@ -39,9 +31,8 @@ outcome gives(kx_uint32_t rflags) {
 
 enum class cacl_before { absent, stale, current };
 
-// One way through the reader: the CACL file it starts from, its flags, a
-// name relative to the working directory or not, and the outcome of each
-// call of each kind in the order made (a kind not listed is not called).
+// The outcome of each call of each kind in the order made (a kind not
+// listed is not called).
 using fault_rows = std::map<sys_call, std::vector<outcome>>;
 struct read_path {
     const char *what;
@@ -60,8 +51,7 @@ int open_descriptors() {
     return static_cast<int>(std::distance(begin(fds), end(fds)));
 }
 
-// A directory with the ACL file, and the CACL file the read starts from:
-// the compiled buffer when current, other bytes when stale.
+// The ACL file and the CACL file the read starts from.
 struct prepared {
     acl_dir d;
     std::string compiled = acl_read(d.acl, TEXT).bytes();
@@ -73,8 +63,7 @@ struct prepared {
         write_file(d.cacl, cacl_bytes);
         shift_mtime(d.cacl, cacl == cacl_before::current ? 0 : -20);
     }
-    // Nothing left but the two files, the CACL file as it was or, when the
-    // read cached, the new one.
+    // Nothing left but the two files, the CACL file as it was or the new one.
     void expect_files_left(bool written) const {
         std::string cacl = read_file(d.cacl);
         EXPECT_EQ(cacl, written ? compiled : cacl_bytes);
@@ -85,8 +74,7 @@ struct prepared {
     }
 };
 
-// Reads with call n of kind failing with err; false when fewer calls of
-// kind were made.
+// Reads with call n of kind failing; false when fewer calls were made.
 bool read_failing(const prepared &p, const std::string &name, kx_uint32_t flags, sys_call kind,
                   long n, int err, const outcome *expected, const std::string &dir) {
     int fds = open_descriptors();
@@ -115,8 +103,7 @@ bool read_failing(const prepared &p, const std::string &name, kx_uint32_t flags,
     return true;
 }
 
-// Fails every call of every kind once, on files prepared afresh each time;
-// the number of calls of each kind must be the number of outcomes listed.
+// Fails every call once, on files prepared afresh each time.
 void fail_each_call(const read_path &path) {
     for (int k = 0; k <= static_cast<int>(sys_call::fcntl); ++k) {
         auto row = path.calls.find(static_cast<sys_call>(k));
@@ -167,7 +154,7 @@ const fault_rows compile_and_cache = {
 // fstat only means compiling, and its descriptor is closed again. Any
 // failure on the way to a current CACL file falls back to the text, which
 // compiles to the same bytes; the CACL file, being newer, stays.
-TEST(SyscallFailure, EachCallOnEachPath) {
+TEST(SyscallFailure, EachCallFailingOrMovingHalfTheBytes) {
     fault_rows stale = compile_and_cache;
     stale[sys_call::fstat].insert(stale[sys_call::fstat].begin(), text_cached);
     stale[sys_call::close].insert(stale[sys_call::close].begin(), text_cached);
@@ -187,11 +174,9 @@ TEST(SyscallFailure, EachCallOnEachPath) {
     // clang-format on
     for (const read_path &path : paths)
         fail_each_call(path);
-}
 
-// A read or a write that moves half the bytes: the read fails showing the
-// bytes it got; the write leaves the read uncached.
-TEST(SyscallFailure, ShortReadAndShortWrite) {
+    // A read or a write that moves half the bytes: the read fails showing
+    // the bytes it got; the write leaves the read uncached.
     prepared p(cacl_before::absent);
     const outcome half_read = fails(SEC_S_FILE_ERROR, MSG_2650_139, {text_size / 2, text_size, 0});
     EXPECT_TRUE(read_failing(p, p.d.acl, CACHE, sys_call::read, 0, 0, &half_read, p.d.dir));
