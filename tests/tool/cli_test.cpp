@@ -66,6 +66,7 @@ TEST(CommandLine, MistakesAreNamed) {
         {{"--cache", "compile"}, "unknown option --cache (before the command)"},
         {{"list", "a", "--type"}, "option --type needs a value"},
         {{"list", "a", "--type", "x"}, "unknown entry type 'x'"},
+        {{"list", "a", "--type", "users"}, "unknown entry type 'users'"},
         {{"list", "a", "--mech", "unix"}, "--mech needs --type user or --type expanded"},
         {{"list", "a", "--buffer", "--owner", "u"},
          "--owner applies to ACL text files, not to buffers"},
@@ -87,12 +88,6 @@ TEST(CommandLine, MistakesAreNamed) {
     // Help wins over whatever else is missing.
     EXPECT_TRUE(parse({"check", "--help"}).inv.help);
     EXPECT_EQ(parse({"check", "--help"}).error, "");
-}
-
-TEST(CommandLine, TypeNamesAndLetters) {
-    for (const auto &[name, letter] :
-         {std::pair{"unauthenticated", 'n'}, {"G", 'g'}, {"e", 'e'}, {"users", '\0'}, {"", '\0'}})
-        EXPECT_EQ(type_letter(name), letter) << name;
 }
 
 // Comments and blank lines are skipped, help texts trimmed; a name of 13
