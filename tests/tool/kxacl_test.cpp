@@ -164,7 +164,6 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
         gives({"check", acl, "--unauthenticated"}, 1, "- 0x00000000\n"),
         gives({"check", acl, "--group", "staff", "admin", "nobody"}, 0,
               "rwcxCqledvsao 0x00001fff\n"),
-        gives({"check", buf, "--group", "staff"}, 0, "rw 0x00000003\n"),
         gives({"check", acl, "--expanded", "unix", "JOE"}, 1, none),
         gives({"check", acl, "--json", "--user", "unix", "joe"}, 1,
               R"({"entry":true,"granted":false,"perms":"","mask":0})"

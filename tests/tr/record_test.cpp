@@ -68,16 +68,14 @@ TEST_F(Records, LinesCarryTimeThreadComponentIdAndHexItems) {
 
     const auto r = read_trace_lines(trace);
     ASSERT_EQ(r.size(), 2u);
-    EXPECT_EQ(r[0].component, "_TST");
-    EXPECT_EQ(r[0].id, 42u);
+    EXPECT_EQ(std::tie(r[0].component, r[0].id, r[0].thread), std::tuple("_TST", 42u, gettid()));
     EXPECT_GE(nanoseconds_of(r[0].seconds, r[0].nanoseconds),
               nanoseconds_of(before.tv_sec, before.tv_nsec));
     EXPECT_LE(nanoseconds_of(r[1].seconds, r[1].nanoseconds),
               nanoseconds_of(after.tv_sec, after.tv_nsec));
-    EXPECT_EQ(r[0].thread, gettid());
     EXPECT_TRUE(r[0].items.empty());
-    EXPECT_EQ(r[1].component, "_NOBODY"); // need not be registered
-    EXPECT_EQ(r[1].id, 4294967295u);
+    // _NOBODY need not be registered.
+    EXPECT_EQ(std::tie(r[1].component, r[1].id), std::tuple("_NOBODY", 4294967295u));
     const char *eight_hex = std::endian::native == std::endian::little ? "08000000" : "00000008";
     EXPECT_EQ(r[1].items, (strings{"0800a0ff", eight_hex, "616200", "-", "-"}));
 }
