@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <optional>
 #include <system_error>
 #include <unistd.h>
 
@@ -127,7 +128,6 @@ namespace {
 bool only(const std::string &s, const char *allowed) {
     return !s.empty() && s.find_first_not_of(allowed) == std::string::npos;
 }
-} // namespace
 
 std::optional<trace_line> parse_trace_line(const std::string &line) {
     std::vector<std::string> f;
@@ -152,6 +152,7 @@ std::optional<trace_line> parse_trace_line(const std::string &line) {
             return std::nullopt;
     return r;
 }
+} // namespace
 
 std::vector<trace_line> read_trace_lines(const std::string &file) {
     std::vector<trace_line> records;

@@ -43,9 +43,7 @@ struct trace_line {
     unsigned long long id = 0;
     std::vector<std::string> items;
 };
-std::optional<trace_line> parse_trace_line(const std::string &line);
-// Every record of a trace file; a line not of the record format fails the
-// test.
+// Every record of a trace file; a line not of that form fails the test.
 std::vector<trace_line> read_trace_lines(const std::string &file);
 
 // The lines of a file; a last line without its newline is marked.

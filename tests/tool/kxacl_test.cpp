@@ -5,7 +5,6 @@
 
 #include <atomic>
 #include <functional>
-#include <random>
 #include <thread>
 #include <tuple>
 #include <vector>
@@ -161,27 +160,19 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
         gives({"check", acl, "--user", "unix", "ROOT"}, 0, "rwcx 0x0000000f\n"),
         gives({"check", acl, "--user", "unix", "joe"}, 1, "- 0x00000000\n"),
         gives({"check", acl, "--user", "unix", "nobody"}, 1, none),
-        gives({"check", acl, "--user", "krb5", "root"}, 1, none),
         gives({"check", acl, "--anyother"}, 0, "r 0x00000001\n"),
         gives({"check", acl, "--unauthenticated"}, 1, "- 0x00000000\n"),
         gives({"check", acl, "--group", "staff", "admin", "nobody"}, 0,
               "rwcxCqledvsao 0x00001fff\n"),
-        gives({"check", buf, "--group", "staff"}, 0, "rw 0x00000003\n"),
-        gives({"check", acl, "--expanded", "unix", "joe"}, 0, "w 0x00000002\n"),
         gives({"check", acl, "--expanded", "unix", "JOE"}, 1, none),
         gives({"check", acl, "--json", "--user", "unix", "joe"}, 1,
               R"({"entry":true,"granted":false,"perms":"","mask":0})"
               "\n"),
         gives({"list", acl}, 0, listing),
         gives({"list", buf}, 0, listing),
-        gives({"list", buf, "--type", "user", "--mech", "UNIX"}, 0,
-              "u unix joe\nu unix root rwcx\n"),
-        gives({"list", buf, "--type=g"}, 0, "g admin rwcxCqledvsao\ng staff rw\n"),
-        gives({"list", acl, "--json", "--type", "e"}, 0,
-              R"({"entries":[{"type":"expanded","mech":"unix","id":"joe","perms":"w","mask":2}]})"
-              "\n"),
+        gives({"list", buf, "--type", "U", "--mech", "UNIX"}, 0, "u unix joe\nu unix root rwcx\n"),
         gives(
-            {"list", buf, "--json", "--type", "n"}, 0,
+            {"list", buf, "--json", "--type", "unauthenticated"}, 0,
             R"({"entries":[{"type":"unauthenticated","mech":null,"id":null,"perms":"","mask":0}]})"
             "\n"),
         gives({"explain", acl, "--user", "unix", "ROOT", "--group", "staff", "aaa", "--expanded",
@@ -196,6 +187,25 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
               "where the walk stops\ngroups staff aaa: rw 0x00000003\n"
               "anyother: r 0x00000001\n  decided by line 4: o r\n"
               "unauthenticated: - 0x00000000\n  decided by line 3: n\n"),
+        gives(
+            {"explain", acl, "--json", "--user", "unix", "nobody", "--expanded", "unix", "joe",
+             "--group", "zzz", "staff"},
+            0,
+            R"({"file":")" + acl +
+                R"j(","source":"text","answers":[{"question":"user","mech":)j"
+                R"j("unix","ids":["nobody"],"entry":false,"perms":"","mask":0,"decided_by":null,)j"
+                R"j("why":"no user entry of mechanism unix names nobody: nobody sorts before root )j"
+                R"j((line 5), where the walk stops; unix user identities are written user@host"},)j"
+                R"j({"question":"expanded","mech":"unix","ids":["joe"],"entry":true,"perms":"w",)j"
+                R"j("mask":2,"decided_by":{"line":9,"position":1,"entry":{"type":"expanded",)j"
+                R"j("mech":"unix","id":"joe","perms":"w","mask":2}},"why":null},{"question":"group",)j"
+                R"j("mech":null,"ids":["zzz"],"entry":false,"perms":"","mask":0,"decided_by":null,)j"
+                R"j("why":"no group entry names zzz: zzz sorts after every group entry (2)"},)j"
+                R"j({"question":"group","mech":null,"ids":["staff"],"entry":true,"perms":"rw",)j"
+                R"j("mask":3,"decided_by":{"line":7,"position":3,"entry":{"type":"group","mech":null,)j"
+                R"j("id":"staff","perms":"rw","mask":3}},"why":null},{"question":"groups","mech":null,)j"
+                R"j("ids":["zzz","staff"],"entry":true,"perms":"rw","mask":3,"decided_by":null,)j"
+                R"j("why":null},{"question":"anyother",...)j"),
         // A buffer file has positions instead of lines.
         gives({"explain", buf, "--user", "krb5", "root"}, 0,
               "user krb5 root: no entry\n  no user entry of mechanism krb5\n"
@@ -220,90 +230,6 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
     const std::string dumped = run_kxacl({"dump", acl}).out;
     EXPECT_EQ(parsed(run_kxacl({"dump", acl, "--json"}))["lines"].size(),
               static_cast<std::size_t>(std::count(dumped.begin(), dumped.end(), '\n')));
-}
-
-// The answers of explain against those of check over random ACLs and
-// requesters; and each deciding entry against the line written for it.
-struct random_acl {
-    std::string text;
-    std::vector<std::pair<std::string, std::string>> line_ids; // per line: type and identity
-};
-
-random_acl make_acl(std::mt19937 &rng) {
-    const auto coin = [&] { return rng() % 2 == 0; };
-    random_acl acl;
-    const auto add = [&](const std::string &type, const std::string &mech, const std::string &id) {
-        if (!coin())
-            return;
-        acl.text += type.substr(0, 1) + (mech.empty() ? "" : " " + mech) +
-                    (id.empty() ? "" : " " + id) + " ";
-        for (const char c : std::string("rwxq"))
-            acl.text += coin() ? std::string(1, c) : "";
-        acl.text += "\n";
-        acl.line_ids.emplace_back(type, id);
-    };
-    add("n", "", "");
-    add("o", "", "");
-    for (const char *mech : {"unix", "krb5"})
-        for (const char *user : {"ann@h1", "Bob@h1", "carl@h2", "dora@h2"})
-            add("user", mech, user);
-    for (const char *group : {"adm", "Staff", "web"})
-        add("group", "", group);
-    for (const char *id : {"uid=1@h1", "uid=2@h1"})
-        add("expanded", "unix", id);
-    return acl;
-}
-
-std::string flip_case(std::mt19937 &rng, std::string s) {
-    for (char &c : s)
-        if (std::isalpha(static_cast<unsigned char>(c)) && rng() % 3 == 0)
-            c = static_cast<char>(c ^ 0x20);
-    return s;
-}
-
-TEST_F(KxaclTool, ExplainAnswersAsCheckDoes) {
-    std::mt19937 rng(17);
-    int decided = 0, undecided = 0;
-    for (int round = 0; round < 16; ++round) {
-        const random_acl made = make_acl(rng);
-        kxtest::write_file(acl, made.text);
-        const char *users[] = {"ann@h1", "bob@h1", "carl@h2", "eve@h1"};
-        const char *groups[] = {"adm", "staff", "web", "zzz"};
-        const std::string mech = rng() % 2 ? "unix" : "KRB5";
-        const json j = parsed(
-            run_kxacl({"explain", acl, "--json", "--user", mech, flip_case(rng, users[rng() % 4]),
-                       "--expanded", "unix", rng() % 2 ? "uid=1@h1" : "UID=2@h1", "--group",
-                       flip_case(rng, groups[rng() % 4]), flip_case(rng, groups[rng() % 4])}));
-        ASSERT_EQ(j["answers"].size(), 7u) << j;
-        for (const json &a : j["answers"]) {
-            const std::string question = a["question"];
-            strings args{"check", acl, "--json",
-                         question == "groups" ? "--group" : "--" + question};
-            if (!a["mech"].is_null())
-                args.push_back(a["mech"]);
-            args.insert(args.end(), a["ids"].begin(), a["ids"].end());
-            const json c = parsed(run_kxacl(args));
-            SCOPED_TRACE(made.text + a.dump());
-            EXPECT_EQ(c["entry"], a["entry"]);
-            EXPECT_EQ(c["mask"], a["mask"]);
-            if (a["decided_by"].is_null()) {
-                undecided += a["entry"] ? 0 : 1;
-                EXPECT_NE(a["why"].is_null(), !a["entry"] && a["question"] != "groups");
-                continue;
-            }
-            ++decided;
-            const json &d = a["decided_by"];
-            EXPECT_EQ(d["entry"]["mask"], a["mask"]);
-            const auto &[type, id] = made.line_ids.at(d["line"].get<std::size_t>() - 1);
-            if (type.size() > 1) { // the anyother and unauthenticated lines are n and o
-                EXPECT_EQ(type, d["entry"]["type"]);
-                EXPECT_EQ(id, d["entry"]["id"]);
-            }
-        }
-    }
-    // Both kinds of answer came up.
-    EXPECT_GT(decided, 20);
-    EXPECT_GT(undecided, 20);
 }
 
 TEST_F(KxaclTool, DiffShowsEachEntrysChangeAndGatesOnGrantingMore) {
