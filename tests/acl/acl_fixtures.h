@@ -1,5 +1,4 @@
-// Known ACL buffers, hand-made buffer pieces, entries and descriptors that
-// the tests own.
+// Known ACL buffers, buffer pieces, entries and descriptors for the tests.
 #ifndef KXACL_TEST_ACL_FIXTURES_H
 #define KXACL_TEST_ACL_FIXTURES_H
 
@@ -9,11 +8,8 @@
 #include <initializer_list>
 #include <string>
 #include <vector>
-
 #include <gtest/gtest.h>
-
 #include <kx_acl.h>
-
 #include "alloc.h"
 #include "byteorder.h"
 #include "convert.h"
@@ -22,7 +18,6 @@
 #include "tree.h"
 
 namespace kxtest {
-
 using bytes = std::vector<unsigned char>;
 using texts = std::vector<std::string>;
 
@@ -158,7 +153,6 @@ struct owned_trees {
     kx_int32_t add(entry e) { return kxacl::sec__add_acle_to_trees(e.p(), &trees, &count); }
 };
 
-// The buffer that the library writes for the entries, added in that order.
 inline bytes build_acl(std::initializer_list<entry> entries) {
     owned_trees t;
     for (entry e : entries)
@@ -203,9 +197,7 @@ inline bytes swapped_order(bytes b) {
     return b;
 }
 
-// Calls that both allocation failure tests make, through fail(n, call) which
-// fails their allocations at its level; each checks what a failure leaves.
-// A user whose host part is normalised:
+// Calls both allocation failure tests make through fail(n, call).
 template <typename Fail> kx_int32_t create_failing(Fail fail, long n) {
     sec_acle_t made = reinterpret_cast<sec_acle_t>(1);
     kx_int32_t rc = fail(
@@ -230,14 +222,12 @@ template <typename Fail> kx_int32_t list_failing(Fail fail, long n, unsigned cha
     return rc;
 }
 
-// Expects the thread's error record to hold message msg with status.
 inline error_record expect_error(kx_int32_t status, int msg) {
     error_record e = last_error();
     EXPECT_EQ(e.id, status);
     EXPECT_EQ(e.msg_num, msg);
     return e;
 }
-
 } // namespace kxtest
 
 #endif

@@ -1,17 +1,11 @@
-// ACL buffers through the exported functions: the empty ACL, copies of a
-// caller's bytes, conversion, release, listing and editing. Argument
-// refusals are in api_table_test, allocation failures in api_alloc_failure_test.
+// ACL buffers through the exported functions.
 #include <gtest/gtest.h>
-
 #include "acl_fixtures.h"
 
 using namespace kxacl;
 using namespace kxtest;
 
 namespace {
-
-// ---- the empty ACL, copies, conversion and release ---------------------------
-
 TEST(AclLifecycle, CreateAndRelease) {
     owned_acl acl;
     ASSERT_EQ(sec_create_empty_acl(acl.get()), SEC_S_OK);
@@ -35,13 +29,9 @@ TEST(AclLifecycle, CreateAndRelease) {
     sec_release_aclelist(nullptr);
 }
 
-// A copy made by sec_read_acl_from_data, converted: the outcome, and the
-// bytes after a success. Three bytes are taken unchecked; only the header's
-// start passes 2650-109. A buffer of the other order is converted whatever
-// its mark; only one in host order is validated.
+// Copies converted: three bytes are taken unchecked; a buffer of the other
+// order is converted whatever its mark; only host order is validated.
 TEST(ConvertAclToHost, Outcomes) {
-    bytes mark_0 = worked_example_swapped;
-    mark_0[2] = 0;
     bytes bad_version = worked_example_swapped, converted = worked_example;
     bad_version[60] = 7; // the ACLE version of bob's record
     converted[60] = 7;
@@ -59,7 +49,6 @@ TEST(ConvertAclToHost, Outcomes) {
         {{1, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_109, {}, {}},
         {{0x85, 1, 2}, 1, SEC_S_BAD_ACL, MSG_2650_119, {3}, {}},
         {worked_example_swapped, 0, SEC_S_OK, 0, {}, worked_example},
-        {mark_0, 0, SEC_S_OK, 0, {}, worked_example},
         {swapped_order(rich), 1, SEC_S_OK, 0, {}, rich},
         {bad_version, 1, SEC_S_OK, 0, {}, converted},
         {converted, 1, SEC_S_BAD_ACLE, MSG_2650_125, {7}, {}},
@@ -83,9 +72,6 @@ TEST(ConvertAclToHost, Outcomes) {
     }
 }
 
-// ---- listing ---------------------------------------------------------------
-
-// type 0 lists everything; a failure leaves the list empty.
 texts listed(const bytes &b, unsigned char type, const char *mech, kx_int32_t status) {
     owned_acl acl(b);
     owned_list list;
@@ -96,12 +82,8 @@ texts listed(const bytes &b, unsigned char type, const char *mech, kx_int32_t st
     return list.described();
 }
 
-// Found by fuzzing: a sub-ACL of length 0 made a walk of all sub-ACLs read
-// the same sub-ACL and its record for every count of the header, 60000
-// times for 46 bytes. The records of a sub-ACL that another one follows
-// must end where that one starts, and a sub-ACL too short for its own
-// header leads on to no other. The last sub-ACL's records may run past its
-// length, as validation allows.
+// Found by fuzzing: a sub-ACL of length 0 made a listing walk the same
+// sub-ACL for every count of the header.
 bytes zero_length_subacl() {
     bytes b =
         make_acl({make_subacl(4, 1, text_field("unix"), {make_record(1, text_field("bob"))})});
@@ -141,10 +123,8 @@ TEST(ListAcl, OrderSpellingAndRefusals) {
         {"users of a mech", rich, SEC_ACLE_USER, "UNIX", SEC_S_OK, 0, unix_users},
         {"users of every mech", rich, SEC_ACLE_USER, nullptr, SEC_S_OK, 0, users},
         {"unauthenticated, any mech", rich, 1, "a-mechanism-of-20-ch", SEC_S_OK, 0, {"1  - 1"}},
-        {"no expanded krb5", rich, SEC_ACLE_EXPANDED, "krb5", SEC_S_OK, 0, {}},
         {"the empty ACL", {}, 0, nullptr, SEC_S_OK, 0, {}},
         {"no sub-ACLs", empty_acl_bytes, 0, nullptr, SEC_S_OK, 0, {}},
-        {"no sub-ACLs' groups", empty_acl_bytes, SEC_ACLE_GROUP, nullptr, SEC_S_OK, 0, {}},
         // Neither the mechanism's case nor non-UTF-8 bytes are touched.
         {"as stored", make_acl({make_subacl(4, 2, text_field("UniX"),
                                             {make_record(1, text_field("\xe9t\xe9")),
@@ -180,8 +160,6 @@ TEST(ListAcl, OrderSpellingAndRefusals) {
             expect_error(c.status, c.msg);
     }
 }
-
-// ---- editing ---------------------------------------------------------------
 
 bytes worked_part(long from, long to) {
     return bytes(worked_example.begin() + from, worked_example.begin() + to);
@@ -221,11 +199,8 @@ TEST(AddAcle, NewEntriesAndSubacls) {
                   make_subacl(1, 1, {}, {make_record(2)})}));
 }
 
-// Found by fuzzing: validation lets bytes follow the last sub-ACL, and a
-// new sub-ACL appended behind them could not be reached by its length walk.
-// It goes right after the last sub-ACL; when that one's records do not end
-// where its length says (which validation lets pass for the last one only),
-// no sub-ACL can follow it and the add is refused.
+// Found by fuzzing: a new sub-ACL goes right after the last one, before
+// trailing bytes; if the last one's records overrun its length, it is refused.
 TEST(AddAcle, NewSubaclGoesBeforeTrailingBytes) {
     const bytes trailing = {0xde, 0xad};
     bytes base = make_acl({anyother_r});
@@ -273,7 +248,6 @@ TEST(DelAcle, ByIdentityAndRefusals) {
     EXPECT_EQ(acl.contents(), make_acl({anyother_r, group_staff}));
     EXPECT_EQ(del(acl, {SEC_ACLE_USER, 0xff, "UNIX", "BOB"}), SEC_S_ACLE_NOT_FOUND);
     EXPECT_TRUE(record_is(SEC_S_ACLE_NOT_FOUND, MSG_2650_118, {4, "UNIX", "BOB"}));
-    EXPECT_EQ(del(acl, {SEC_ACLE_GROUP, 0, "", "wheel"}), SEC_S_ACLE_NOT_FOUND);
     ASSERT_EQ(del(acl, {SEC_ACLE_GROUP, 0, "", "Staff"}), SEC_S_OK);
     ASSERT_EQ(del(acl, {SEC_ACLE_ANYOTHER, 0}), SEC_S_OK);
     EXPECT_EQ(acl.contents(), empty_acl_bytes);
@@ -291,5 +265,4 @@ TEST(DelAcle, ByIdentityAndRefusals) {
     EXPECT_EQ(del(no_entries, {SEC_ACLE_GROUP, 0, "", "staff"}), SEC_S_BAD_ACLE);
     EXPECT_TRUE(record_is(SEC_S_BAD_ACLE, MSG_2650_118, {16, "", "staff"}));
 }
-
 } // namespace

@@ -1,12 +1,9 @@
-// Dumping ACL buffers, sub-ACLs and entries into a sink of lines and
-// failures, and the streams that the C functions give each channel.
+// Dumping ACL buffers, sub-ACLs and entries, and the C functions' streams.
 #include <cstdio>
 #include <cstdlib>
 #include <string>
 #include <vector>
-
 #include <gtest/gtest.h>
-
 #include "acl_fixtures.h"
 #include "buffer_format.h"
 #include "dump.h"
@@ -16,15 +13,13 @@ using kxtest::build_acl;
 using kxtest::bytes;
 
 namespace {
-
 struct recorded final : dump_sink {
     std::string lines, failures;
     void line(const char *text) noexcept override { lines += text; }
     void failure(const char *text) noexcept override { failures += text; }
 };
 
-// From a heap block of exactly the bytes' size, so that the address
-// sanitizer catches a read past the end.
+// An exactly sized heap block, for the address sanitizer.
 recorded dump(const bytes &b) {
     kxtest::owned_acl acl(b);
     recorded r;
@@ -54,7 +49,6 @@ bytes admin_acl(std::uint16_t subacl_count = 1) {
     return b;
 }
 
-// The formatted text of the record that a failed translation leaves.
 std::string bad_mask_text() {
     char perms[33];
     sec_translate_bitmask(0x2000, nullptr, perms);
@@ -90,8 +84,7 @@ TEST(DumpAcl, LinesAndFailuresOfWholeBuffers) {
         {{0x84}, not_valid, ""},
         {admin_acl(2), descriptor(34, 2) + subacl("\t", 29, 4, "unix", 1) + "\t\t" + admin_line,
          "2650-110"},
-        // Too short for its own header, it can neither hold the records of a
-        // sub-ACL that another one follows nor lead on.
+        // Too short for its own header: no records, and it leads on to nothing.
         {zero_length, descriptor(34, 2) + subacl("\t", 0, 4, "unix", 1), "2650-110"},
         {bad_count, descriptor(22, 1) + subacl("\t", 17, 2, "", 2), "2650-111"},
     };
@@ -113,8 +106,7 @@ TEST(DumpAcl, LinesAndFailuresOfWholeBuffers) {
     }
 }
 
-// sec__dump_acl_to gives each channel its stream and drops one without;
-// sec__dump_acl's are standard error and output. No bytes dump nothing.
+// sec__dump_acl_to: each channel's stream, none dropped; sec__dump_acl: stderr, stdout.
 TEST(DumpAcl, StreamsOfTheCFunctions) {
     struct memory_stream {
         char *data = nullptr;
@@ -131,8 +123,6 @@ TEST(DumpAcl, StreamsOfTheCFunctions) {
     kxtest::owned_acl acl(admin_acl(2));
     unsigned char byte = 0x85;
     sec_buffer_desc none[] = {{0, nullptr}, {5, nullptr}, {0, &byte}, {-1, &byte}};
-    // With the standard streams caught too, so that what a null stream
-    // does not drop shows.
     std::FILE *const saved_err = stderr, *const saved_out = stdout;
     stderr = err.file; // the C library's standard streams are variables
     stdout = out.file;
@@ -148,8 +138,6 @@ TEST(DumpAcl, StreamsOfTheCFunctions) {
     EXPECT_EQ(out.text(), expected.failures);
 }
 
-// The entries' lead space is the sub-ACL's and a tab; no memory for it is
-// a failure.
 TEST(DumpSubacl, LeadSpaceAndNoMemoryForIt) {
     const bytes b = admin_acl();
     const acl_bytes in{b.data(), b.size()};
@@ -171,8 +159,6 @@ TEST(DumpSubacl, LeadSpaceAndNoMemoryForIt) {
     EXPECT_NE(failed.failures.find("sec__dump_subacl"), std::string::npos);
 }
 
-// The caller's templates; an entry that cannot be displayed shows its
-// failure as its line.
 TEST(DumpAcle, TemplatesNullEntryAndAnEntryThatCannotBeDisplayed) {
     sec_perm_desc perms[] = {{0x100, 'z', "zap", ""}};
     sec_perm_set_desc set{1, perms};
@@ -188,5 +174,4 @@ TEST(DumpAcle, TemplatesNullEntryAndAnEntryThatCannotBeDisplayed) {
     EXPECT_EQ(r.failures, "");
     EXPECT_EQ(kxtest::last_error().id, 0);
 }
-
 } // namespace

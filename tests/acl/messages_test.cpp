@@ -1,19 +1,15 @@
 // The message table and the reporting helper.
 #include <cstring>
 #include <string>
-
 #include <gtest/gtest.h>
-
 #include <kx_acl.h>
-
 #include "messages.h"
 #include "report.h"
 #include "support.h"
 
 using namespace kxacl;
 
-// Entries of other components are empty, never null; the numbered messages
-// stand at their catalogue indices: 2650-101 at 88 up to 2650-158 at 145,
+// Other components' entries are empty; 2650-101 at 88 .. 2650-158 at 145,
 // then 2650-165 at 151 onwards.
 TEST(MessageTable, FixedEntriesAndNumberedMessages) {
     EXPECT_STREQ(cu_mesgtbl_kxseclib_msg[0], "Reserved: DO NOT USE!");
@@ -37,25 +33,7 @@ TEST(MessageTable, FixedEntriesAndNumberedMessages) {
     EXPECT_EQ(filled, 61);
 }
 
-// The scan by which reports are checked against their message at compile
-// time: numbered conversions with flags, "%%", unnumbered conversions (not
-// counted), and numbers that a text skips (integers).
-TEST(MessageTable, PlaceholderCounts) {
-    EXPECT_EQ(placeholder_count("none: 100%%1$s sure, %d %s"), 0);
-    const char *text = "%%%4$#x %2$s at %1$08x, %3$-4d";
-    EXPECT_EQ(placeholder_count(text), 4);
-    EXPECT_EQ(placeholder_kind(text, 1), arg_kind::integer);
-    EXPECT_EQ(placeholder_kind(text, 2), arg_kind::text);
-    EXPECT_EQ(placeholder_kind(text, 5), arg_kind::none);
-    // 2650-126 and 2650-127 start at their second placeholder.
-    EXPECT_EQ(placeholder_count(message_text(MSG_2650_127)), 3);
-    EXPECT_EQ(placeholder_kind(message_text(MSG_2650_126), 1), arg_kind::integer);
-    EXPECT_EQ(placeholder_kind(message_text(MSG_2650_127), 2), arg_kind::text);
-}
-
-// The record as the catalogue expects it; a pointer shows as its low 32
-// bits, a skipped placeholder gets 0 and the position follows, and huge
-// byte counts do not wrap.
+// Pointers show their low 32 bits; huge byte counts do not wrap.
 TEST(Report, FillsTheRecordAsTheCatalogueExpects) {
     int x = 0;
     EXPECT_EQ(bad_param("sec_list_acl", 2, static_cast<void *>(nullptr)), SEC_S_BAD_PARAM);
