@@ -34,11 +34,9 @@ struct outputs {
                acl.value == marked<void *>();
     }
 };
-
 long long shown(const void *p) {
     return static_cast<int>(pointer_value(p));
 }
-
 using run_fn = std::function<kx_int32_t(outputs &)>;
 struct refusal {
     kx_int32_t status;
@@ -47,38 +45,31 @@ struct refusal {
     run_fn run;
     std::function<void(const outputs &)> left = nullptr; // else: every output untouched
 };
-
 refusal param(const char *routine, int pos, long long value, run_fn run) {
     return {SEC_S_BAD_PARAM, MSG_2650_101, {routine, pos, value}, std::move(run)};
 }
-
 kx_int32_t single(sec_acl_buffer_t acl, unsigned char type, const char *mech, const char *id,
                   kx_uint32_t *perm) {
     return sec__single_acle_perm(acl, type, const_cast<char *>(mech), nullptr,
                                  const_cast<char *>(id), perm);
 }
-
 kx_int32_t edit_of(kx_int32_t (*edit)(sec_acle_t, sec_acl_buffer_t), entry e, const bytes &b) {
     owned_acl acl(b);
     kx_int32_t rc = edit(e.p(), acl.get());
     EXPECT_EQ(acl.contents(), b);
     return rc;
 }
-
 constexpr auto add_fn = &sec_add_acle_to_acl, del_fn = &sec_del_acle_from_acl;
 kx_int32_t display(entry e, outputs &o) {
     return sec_display_acle_id(e.p(), &o.mech, &o.id);
 }
-
 kx_int32_t read_with(const char *name, const char *user, kx_uint32_t flags, sec_buffer_s *acl,
                      outputs &o) {
     return sec_read_acl_file(name, user, nullptr, flags, acl, &o.rflags);
 }
-
 kx_int32_t never_called(char *, char *) {
     return 0;
 }
-
 std::vector<refusal> refusals() {
     static owned_acl good(worked_example);
     static bytes bad_type = worked_example, bad_version = worked_example;
@@ -268,20 +259,17 @@ std::string described(unsigned id, const std::vector<std::string> &items) {
         s += " " + (i.empty() ? std::string("-") : i);
     return s;
 }
-
 struct expected {
     std::vector<std::string> records;
     void at(unsigned id, const std::vector<std::string> &items = {}) {
         records.push_back(described(id, items));
     }
 };
-
 const auto u8 = [](std::uint8_t v) { return hex_of(v); };
 const auto u32 = [](kx_uint32_t v) { return hex_of(v); };
 const auto i32 = [](kx_int32_t v) { return hex_of(v); };
 const auto ptr = [](const void *p) { return hex_of(p); };
 const auto txt = [](const std::string &s) { return hex_text(s); };
-
 struct world {
     owned_acl acl, from_file, empty;
     sec_acle_t acle = nullptr;
@@ -440,16 +428,5 @@ TEST(ApiTrace, PerfLevelIsAnnouncedAtRegistration) {
     sec_translate_perms("r", nullptr, &mask);
     ASSERT_EQ(trace_ids(file), (std::vector<unsigned>{0}));
     EXPECT_EQ(read_trace(file)[0].items, (std::vector<std::string>{i32(2)}));
-}
-
-// A registration that the trace library refuses leaves the caller's record.
-TEST(ApiTrace, FailedRegistrationKeepsTheCallersRecord) {
-    static tr_detail_level_t levels[1];
-    static const tr_category_description_t cats[1] = {{0, "Other", 0, 0}};
-    ASSERT_EQ(tr_register_component_1("_SEL", levels, cats, 1), TR_OK);
-    bad_param("caller", 7, 0x1234u);
-    kx_uint32_t mask;
-    EXPECT_EQ(sec_translate_perms("r", nullptr, &mask), SEC_S_OK);
-    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
 }
 } // namespace

@@ -1,7 +1,9 @@
 // Entry trees; order and duplicates also show through buffers_test.
+#include <algorithm>
 #include <string>
 #include <vector>
 #include <gtest/gtest.h>
+#include <kx_cu.h>
 #include "acl_fixtures.h"
 
 using namespace kxacl;
@@ -50,5 +52,25 @@ TEST(Acltree, ArrayHoldsOneTreePerKeyInOrderOfFirstOccurrence) {
               worked_example);
     EXPECT_EQ(build_acl({}), empty_acl_bytes);
     EXPECT_EQ(swapped_order(worked_example), worked_example_swapped); // the tests' own helper
+}
+// Many identities, in order and shuffled, walk strictly ascending.
+TEST(Acltree, ManyIdentities) {
+    constexpr int count = 100000;
+    owned_tree sorted, shuffled;
+    for (int i = 0; i < count; ++i) {
+        std::string in_order = "u" + std::to_string(1000000 + i),
+                    permuted = "user-" + std::to_string(i * 7919 % count);
+        ASSERT_EQ(sorted.add(1, {SEC_ACLE_USER, 1, "unix", in_order.c_str()}), SEC_S_OK);
+        ASSERT_EQ(shuffled.add(1, {SEC_ACLE_USER, 1, "unix", permuted.c_str()}), SEC_S_OK);
+    }
+    auto not_after = [](const std::string &a, const std::string &b) {
+        return cu_strcasecmp_posix_1(a.c_str(), b.c_str()) >= 0;
+    };
+    for (owned_tree *t : {&sorted, &shuffled}) {
+        texts ids = t->walked();
+        EXPECT_EQ(ids.size(), std::size_t{count});
+        EXPECT_EQ(std::adjacent_find(ids.begin(), ids.end(), not_after), ids.end());
+    }
+    EXPECT_EQ(shuffled.add(1, {SEC_ACLE_USER, 1, "unix", "User-99999"}), SEC_S_BAD_ACLE);
 }
 } // namespace
