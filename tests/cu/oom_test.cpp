@@ -50,15 +50,6 @@ TEST_F(OutOfMemoryTest, StoringLeavesTheNoMemoryRecord) {
     EXPECT_EQ(current_record(), no_memory_record);
 }
 
-// A cleared record's block holds the next record that fits, with no
-// allocation at all.
-TEST_F(OutOfMemoryTest, ClearedRecordHoldsTheNextOne) {
-    ASSERT_EQ(cu_set_error_1(4, "f", "c", 1, 2, "%1$s", "a longer argument"), 0);
-    cu_set_no_error_1();
-    EXPECT_EQ(without_memory([] { return cu_set_error_1(5, "f", "c", 1, 3, "%1$s", "short"); }), 0);
-    EXPECT_EQ(current_record(), R"(5 "f" "c" 1.3 "%1$s" [s"short"])");
-}
-
 TEST_F(OutOfMemoryTest, GettersHandOutStaticResultsThatReleaseAccepts) {
     ASSERT_EQ(cu_set_error_1(4, nullptr, nullptr, 0, 0, "value %1$d", 1), 0);
     const unique_error copy = current_error();

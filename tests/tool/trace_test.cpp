@@ -47,20 +47,6 @@ const std::tuple<unsigned, std::string, std::string, int> every_point[] = {
 #undef KXTEST_POINT
 #undef KXTEST_ITEM
 
-TEST(TraceDecode, EveryPointIsDecodedByNameWithItsItems) {
-    const char *category_names[] = {"Errors", "Info", "API", "Buffer", "Perf"};
-    kxtool::trace_decoder decoder(false, {}, kxtool::perm_letters{});
-    for (const auto &[id, name, items, category] : every_point) {
-        const std::string out =
-            decoder.decode_line(record(id, items.substr(items.empty() ? 0 : 1)));
-        EXPECT_NE(out.find(std::string(" ") + category_names[category] + " " + name +
-                           (items.empty() ? "\n" : " ")),
-                  std::string::npos)
-            << id << " " << name << ": " << out;
-    }
-    EXPECT_EQ(decoder.undecoded(), 0u);
-}
-
 kx_int32_t read(const std::string &path, kx_uint32_t flags) {
     sec_buffer_s acl{0, nullptr};
     const kx_int32_t status =
@@ -225,33 +211,6 @@ TEST(TraceDecode, UnknownRecordsAreShownRawAndCounted) {
             kxtool::make_trace_filter(list(threads), list(categories), list(points), error));
         EXPECT_EQ(error, why);
     }
-}
-
-TEST(TraceDecode, JsonLinesCarryEveryField) {
-    const std::string trace = kxtest::temp_dir() + "/trace";
-    kxtest::write_file(trace, record(84, "00000000 03000000") + "\n" + record(84, "") + "\n" +
-                                  record(84, "00000000 03000000") + " torn");
-    const auto r = run_kxacl({"trace", "--json", "--thread", "17558", trace});
-    EXPECT_EQ(r.exit_code, 1);
-    EXPECT_EQ(r.err, "kxacl: 2 line(s) not decoded, shown raw\n");
-    std::istringstream lines(r.out);
-    std::vector<json> records;
-    for (std::string line; std::getline(lines, line);)
-        records.push_back(json::parse(line));
-    ASSERT_EQ(records.size(), 3u) << r.out;
-    records[0].erase("time"); // local time
-    records[1].erase("time");
-    EXPECT_EQ(records[0], json::parse(R"({"seconds":1795490249,"nanoseconds":353813164,
-        "thread":17558,"component":"_SEL","id":84,"category":"API",
-        "point":"sec__single_acle_perm:exit","items":{"status":{"code":0,"name":"SEC_S_OK"},
-        "perm":{"mask":3,"letters":"rw"}}})"));
-    EXPECT_EQ(records[1], json::parse(R"({"seconds":1795490249,"nanoseconds":353813164,
-        "thread":17558,"component":"_SEL","id":84,"raw":")" +
-                                      record(84, "") + "\"}"));
-    EXPECT_EQ(records[2], json({{"raw", record(84, "00000000 03000000") + " torn"}}));
-    // Only the line that is no record at all has no thread to be judged by.
-    EXPECT_EQ(run_kxacl({"trace", "--thread", "1", trace}).out,
-              "raw: " + record(84, "00000000 03000000") + " torn\n");
 }
 
 } // namespace

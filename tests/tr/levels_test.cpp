@@ -1,12 +1,10 @@
 // Registration and levels of detail: defaults, KX_TRACE_LEVELS, run-time
 // changes, and the arguments the registry refuses.
 #include <array>
-#include <atomic>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -67,40 +65,6 @@ TEST_F(Levels, ConfiguredLevelsAreAppliedAtRegistration) {
     }
 }
 
-// A setting far longer than any buffer is read to its end.
-TEST_F(Levels, OverlongConfigurationIsReadToItsEnd) {
-    std::string overlong = "_TST:";
-    for (int i = 0; i < 20000; ++i)
-        overlong += "Unknown=1,";
-    setenv("KX_TRACE_LEVELS", (overlong + "API=6").c_str(), 1);
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
-    EXPECT_EQ(levels, (levels_t{0, 6, 3, 9, 4}));
-}
-
-// Set changes the named categories of its component only, and refuses what
-// it cannot name, keeping errno.
-TEST_F(Levels, SetChangesNamedCategoriesOfItsComponentOnly) {
-    levels_t other = untouched;
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
-    ASSERT_EQ(register_as("_TWO", other), TR_OK);
-    errno = 4242;
-    EXPECT_EQ(tr_set_detail_level_1("_tst", "API", 5), TR_NOT_REGISTERED);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "Nope", 5), TR_BAD_ARGUMENT);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "", 5), TR_BAD_ARGUMENT);
-    EXPECT_EQ(tr_set_detail_level_1(nullptr, "API", 5), TR_BAD_ARGUMENT);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", nullptr, 5), TR_BAD_ARGUMENT);
-    EXPECT_EQ(errno, 4242);
-    EXPECT_EQ(levels, defaults);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "api", 5), TR_OK);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "Perf", 0), TR_OK);
-    EXPECT_EQ(tr_set_detail_level_1("_TST", "Errors", 200), TR_OK);
-    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
-    EXPECT_EQ(tr_set_detail_level_1("_TWO", "*", 0), TR_OK);
-    EXPECT_EQ(other, minimums);
-    EXPECT_EQ(levels, (levels_t{9, 5, 2, 9, 4}));
-    EXPECT_EQ(tr_unregister_component_1("_TWO"), TR_OK);
-}
-
 // Each part that cannot be read is named once on standard error: syntax
 // once per process, a category the component lacks at its registration; a
 // few warnings at most. Empty parts are no mistake.
@@ -122,30 +86,6 @@ TEST_F(Levels, UnreadablePartsAreWarnedAboutByName) {
                   prefix + "no category \"a\" in _TST" + all + prefix +
                   "no category \"b\" in _TST" + all + prefix + "no category \"c\" in _TST" + all +
                   prefix + "further mistakes not shown\n");
-}
-
-// Clients read levels without locks while they change; ThreadSanitizer
-// checks that the library's stores are atomic.
-TEST_F(Levels, ReadersSeeOnlyWholeLevelsWhileTheyChange) {
-    ASSERT_EQ(register_as("_TST", levels), TR_OK);
-    ASSERT_EQ(tr_set_detail_level_1("_TST", "API", 2), TR_OK);
-    std::atomic<bool> done{false};
-    std::atomic<int> odd_reads{0}, failed_sets{0};
-    std::vector<std::thread> readers;
-    for (int r = 0; r < 3; ++r)
-        readers.emplace_back([&] {
-            while (!done) {
-                const auto api = __atomic_load_n(&levels[1], __ATOMIC_RELAXED);
-                odd_reads += api != 2 && api != 8;
-            }
-        });
-    for (int i = 0; i < 20000; ++i)
-        failed_sets += tr_set_detail_level_1("_TST", "API", i % 2 ? 8 : 2) != TR_OK;
-    done = true;
-    for (auto &t : readers)
-        t.join();
-    EXPECT_EQ(failed_sets, 0);
-    EXPECT_EQ(odd_reads, 0);
 }
 
 // Bad registrations are refused without effect, keeping errno; the
