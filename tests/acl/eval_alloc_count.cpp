@@ -1,8 +1,5 @@
-// Counts every heap allocation of the process (malloc replaced) while
-// evaluations run. Once each request has been made, evaluations with tracing
-// off allocate nothing: the records of refusals and of rejecting handlers
-// take the block of the record the call cleared. An executable of its own,
-// as it replaces the process's allocator; not built under the sanitizers.
+// Once each request has been made, evaluations allocate nothing: records
+// reuse the cleared record's block. Its own executable (malloc replaced).
 #include "eval_fixtures.h"
 #include "heap.h"
 
@@ -41,5 +38,4 @@ TEST(EvaluationAllocCount, EvaluationsAllocateNothing) {
     EXPECT_EQ(kxtest::last_error().msg_num, kxacl::MSG_2650_147);
     EXPECT_EQ(kxacl::mem_allocations(), library_before);
 }
-
 } // namespace

@@ -1,5 +1,4 @@
-// Helpers of the evaluation tests: an ACL of every kind of entry, the two
-// evaluation calls as values, identity handlers, and requests with answers.
+// Helpers of the evaluation tests.
 #ifndef KXACL_TEST_EVAL_FIXTURES_H
 #define KXACL_TEST_EVAL_FIXTURES_H
 
@@ -26,7 +25,6 @@ inline bytes sample_acl() {
          make_subacl(SEC_ACLE_GROUP, 2, {}, {rec(0x100, "admin"), rec(0x200, "staff")}),
          make_subacl(SEC_ACLE_ANYOTHER, 1, {}, {rec(0x80)})});
 }
-
 using group_list = std::vector<sec_buffer_s>;
 
 inline group_list groups_named(const std::vector<const char *> &names) {
@@ -35,14 +33,11 @@ inline group_list groups_named(const std::vector<const char *> &names) {
         groups.push_back({0, const_cast<char *>(n)});
     return groups;
 }
-
 constexpr kx_uint32_t untouched = 0xdeadbeef; // a result's perm before the call
-
 struct result {
     kx_int32_t status;
     kx_uint32_t perm;
 };
-
 inline result single(sec_acl_buffer_t acl, unsigned char type, const char *mech, const char *zmech,
                      const char *id) {
     result r{0, untouched};
@@ -50,13 +45,11 @@ inline result single(sec_acl_buffer_t acl, unsigned char type, const char *mech,
                                      const_cast<char *>(id), &r.perm);
     return r;
 }
-
 inline result groups_of(sec_acl_buffer_t acl, group_list &groups, kx_int32_t count) {
     result r{0, untouched};
     r.status = sec__group_acles_perm(acl, count, groups.empty() ? nullptr : groups.data(), &r.perm);
     return r;
 }
-
 inline std::atomic<int> handler_calls{0};
 
 // Accepts "u:<name>" for the entry <name>, ordering like the plain comparison.
@@ -75,9 +68,7 @@ inline kx_int32_t wildcard_with_record(char *id, char *acle_id) {
     return std::strcmp(id, acle_id) < 0 ? -1 : 1;
 }
 
-// Requests on sample_acl with prefixed_user and wildcard_with_record
-// registered (see register_sample_handlers), and their answers. The group
-// request asks for sample_groups.
+// Requests on sample_acl with register_sample_handlers; groups: sample_groups.
 struct sample_request {
     unsigned char type;
     const char *mech, *id;
@@ -96,18 +87,15 @@ inline const sample_request sample_requests[] = {
     {SEC_ACLE_USER, "unix", "zed", {SEC_S_BAD_ACLE, 0}},
 };
 inline const std::vector<const char *> sample_groups = {"wheel", "staff", "nobody", "ADMIN"};
-
 inline kx_int32_t register_sample_handlers() {
     kx_int32_t rc = sec__register_id_handler(SEC_ID_HANDLER_USER, "unix", prefixed_user);
     return rc ? rc
               : sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", wildcard_with_record);
 }
-
 inline result ask_sample(sec_acl_buffer_t acl, group_list &groups, const sample_request &q) {
     return q.type == SEC_ACLE_GROUP ? groups_of(acl, groups, static_cast<kx_int32_t>(groups.size()))
                                     : single(acl, q.type, q.mech, nullptr, q.id);
 }
-
 } // namespace evaltest
 
 #endif

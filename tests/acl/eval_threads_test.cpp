@@ -1,6 +1,5 @@
-// Evaluation from many threads at once while other threads register
-// handlers, so that the registry's array grows and moves under the
-// lookups. Meant to run under ThreadSanitizer as well as plainly.
+// Evaluation from many threads while others register handlers, so that
+// the registry's array moves under the lookups. Also for TSan.
 #include <thread>
 
 #include "eval.h"
@@ -15,7 +14,6 @@ namespace {
 kx_int32_t late(char *, char *) {
     return 0;
 }
-
 std::string mech_of(int registrar, int i) {
     return std::to_string(registrar) + '-' + std::to_string(i);
 }
@@ -59,5 +57,4 @@ TEST(EvaluationThreads, EvaluateWhileRegistering) {
             EXPECT_EQ(h, late) << mech_of(t, i);
         }
 }
-
 } // namespace

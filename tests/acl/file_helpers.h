@@ -1,5 +1,4 @@
-// Helpers of the ACL file tests: files with given bytes, modes and times,
-// directory listings, paths of exact lengths, and throw-away users.
+// Helpers of the ACL file tests.
 #ifndef KXACL_TEST_FILE_HELPERS_H
 #define KXACL_TEST_FILE_HELPERS_H
 
@@ -22,7 +21,6 @@ inline void write_file(const std::string &path, const std::string &bytes, mode_t
     ASSERT_EQ(fchmod(fd, mode), 0);
     close(fd);
 }
-
 inline std::string read_file(const std::string &path) {
     std::string bytes;
     int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
@@ -34,27 +32,24 @@ inline std::string read_file(const std::string &path) {
     close(fd);
     return bytes;
 }
-
 inline struct stat status_of(const std::string &path) {
     struct stat st {};
     EXPECT_EQ(lstat(path.c_str(), &st), 0) << path;
     return st;
 }
 
-// Moves the file's modification time by delta seconds.
 inline void shift_mtime(const std::string &path, long delta) {
     timespec times[2] = {{0, UTIME_OMIT}, status_of(path).st_mtim};
     times[1].tv_sec += delta;
     ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;
 }
 
-// Sets the modification time to exactly seconds (and 0 nanoseconds).
 inline void set_mtime(const std::string &path, time_t seconds) {
     timespec times[2] = {{0, UTIME_OMIT}, {seconds, 0}};
     ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;
 }
 
-// The names in a directory, sorted, without "." and "..".
+// Sorted, without "." and "..".
 inline std::vector<std::string> dir_entries(const std::string &dir) {
     std::vector<std::string> names;
     if (DIR *d = opendir(dir.c_str())) {
@@ -77,8 +72,7 @@ inline std::vector<arg> in_dir(const std::string &dir, std::vector<arg> args) {
     return args;
 }
 
-// A path of exactly length characters under base, whose directories are
-// made; the last component (the file) is not.
+// A path of exactly length characters under base; its directories are made.
 inline std::string path_of_length(const std::string &base, std::size_t length) {
     std::string p = base;
     while (length - p.size() > 256) {
@@ -88,15 +82,13 @@ inline std::string path_of_length(const std::string &base, std::size_t length) {
     return p + "/" + std::string(length - p.size() - 1, 'f');
 }
 
-// The ACL compiled from example_text.
 inline std::string example_acl() {
     return std::string(worked_example.begin(), worked_example.end());
 }
 inline const char example_text[] = "u unix bob rw\ng staff r\no r\n";
-
 constexpr kx_uint32_t TEXT = SEC_F_ACL_TEXT, CACHE = SEC_F_ACL_CACHE, CONVERT = SEC_F_ACL_CONVERT;
 
-// One call of sec_read_acl_file; the status is computed once the outputs exist.
+// One call of sec_read_acl_file.
 struct acl_read {
     sec_buffer_s acl{0, nullptr};
     kx_uint32_t rflags = 0xdeadbeef; // until the call sets it
@@ -134,14 +126,12 @@ inline void flip_before(kxacl::sys_call kind, long nth, std::function<void()> *f
         kind, nth, [](void *f) { (*static_cast<std::function<void()> *>(f))(); }, flip);
 }
 
-// The ACL compiled from text.
 inline std::string compiled(const std::string &text) {
     acl_dir d(text);
     return acl_read(d.acl, SEC_F_ACL_TEXT).bytes();
 }
 
-// A user made for one test. The password files are locked while another
-// useradd runs: commands are tried again for up to 5 seconds.
+// A user made for one test; commands are retried while useradd locks files.
 struct scoped_user {
     static inline int made = 0;
     std::string name = "kxt" + std::to_string(getpid()) + "x" + std::to_string(made++);
@@ -161,13 +151,11 @@ struct scoped_user {
         return false;
     }
 };
-
 #define KXTEST_REQUIRE_ROOT()                                                                      \
     do {                                                                                           \
         if (geteuid() != 0)                                                                        \
             GTEST_SKIP() << "SKIPPED: needs root (creates users or changes file owners)";          \
     } while (0)
-
 } // namespace kxtest
 
 #endif

@@ -1,6 +1,4 @@
-// The ACL text parser: one table of single lines with the entry or the
-// refusal each gives, one of texts read line by line with the cursor, the
-// remaining length and the line number after each call, and the locales.
+// The ACL text parser: single lines, texts line by line, and the locales.
 #include <cctype>
 #include <clocale>
 #include <cstdint>
@@ -17,9 +15,8 @@ using kxtest::arg;
 
 namespace {
 
-// A text as sec_read_acl_file hands it over: the bytes and a NUL, the
-// remaining length counting that NUL. A shorter length keeps only that many
-// bytes, in a block of exactly that size.
+// The bytes and a NUL, as sec_read_acl_file hands them over, or only keep
+// bytes in a block of exactly that size.
 struct text_reader {
     std::size_t size, length;
     std::unique_ptr<char[]> bytes;
@@ -27,7 +24,6 @@ struct text_reader {
     int lineno = 1;
     sec_acle_desc acle{};
     sec_perm_set_t permset = nullptr;
-
     explicit text_reader(const std::string &text, std::size_t keep = SIZE_MAX)
         : size(std::min(keep, text.size() + 1)), length(size), bytes(new char[size]),
           cursor(bytes.get()) {
@@ -39,18 +35,14 @@ struct text_reader {
     }
     char *at(std::size_t offset) { return bytes.get() + offset; }
 };
-
 struct expected_entry {
     unsigned char type;
     const char *mech, *id; // id null for none
     kx_uint32_t perm;
 };
-
 constexpr expected_entry none{0, "", nullptr, 0};
 constexpr kx_int32_t bad = SEC_S_BAD_ACL, perm = SEC_S_BAD_PERMISSION, long_line = SEC_S_FILE_ERROR;
 
-// After an entry (1) or the end (0), the entry (identities point into the
-// text) and no record; after a refusal, its record.
 void expect_outcome(text_reader &r, kx_int32_t rc, kx_int32_t status, const expected_entry &e,
                     int msg, const std::vector<arg> &args) {
     EXPECT_EQ(rc, status);
@@ -66,7 +58,6 @@ void expect_outcome(text_reader &r, kx_int32_t rc, kx_int32_t status, const expe
     EXPECT_TRUE(!e.id || (r.acle.id > r.at(0) && r.acle.id < r.at(r.size))) << "not in the text";
 }
 
-// One line: its entry, or its refusal (arguments start with the line).
 struct line_case {
     const char *text;
     kx_int32_t status;
@@ -74,7 +65,6 @@ struct line_case {
     int msg = 0;          // otherwise
     std::vector<arg> args = {};
 };
-
 void expect_line(const line_case &c) {
     SCOPED_TRACE(c.text);
     text_reader r(c.text);
@@ -112,8 +102,8 @@ TEST(ParseText, OneLine) {
         expect_line(c);
 }
 
-// After each call: its result, the entry or the refusal's record, the line
-// number, the cursor's offset (-1: none) and the remaining length.
+// After each call: result, entry or record, line number, cursor offset (-1:
+// none) and remaining length.
 struct step {
     kx_int32_t rc;
     int lineno;
@@ -123,7 +113,6 @@ struct step {
     int msg = 0;
     std::vector<arg> args = {};
 };
-
 struct text_case {
     std::string text;
     std::vector<step> steps;
@@ -131,11 +120,8 @@ struct text_case {
     sec_perm_set_t permset = nullptr;
 };
 
-// A failure moves past its line but keeps the length; on the last line it
-// leaves no cursor. A NUL at a line's start ends the text; one inside a line
-// or none within the length is corrupt and keeps the cursor at the line,
-// unless another fault comes first. Lines hold up to 1096 bytes with their
-// end. Parsing allocates nothing, not even for a failure.
+// A failure moves past its line, keeping the length; a NUL at a line's start
+// ends the text, one inside a line or none is corrupt. Nothing is allocated.
 TEST(ParseText, TextsLineByLine) {
     const std::string file = kxtest::start_tracing("_SEL:Errors=1");
     const expected_entry n{SEC_ACLE_UNAUTHENTICATED, "", nullptr, 0},
@@ -211,7 +197,6 @@ TEST(ParseText, TextsLineByLine) {
     };
     EXPECT_EQ(items,
               (std::vector<std::vector<std::string>>{item(2, 1097), item(3, 1097), item(1, 1201)}));
-
     // The mechanism is lowercased in the text itself.
     text_reader r("U UNIX root");
     ASSERT_EQ(r.next(), 1);
@@ -222,22 +207,17 @@ TEST(ParseText, TextsLineByLine) {
 // the locale sees white space, but only blanks are skipped.
 TEST(ParseText, Locales) {
     ASSERT_TRUE(kxtest::use_build_locale("en_US.ISO-8859-1"));
-    // The locale itself would fold it; volatile, or gcc -O3 folds the call
-    // as in the C locale.
+    // volatile, or gcc -O3 folds the call as in the C locale.
     volatile int capital_e_acute = 0xc9, no_break_space = 0xa0;
     ASSERT_EQ(std::tolower(capital_e_acute), 0xe9);
     expect_line({"u UN\xc9X joe", 1, {SEC_ACLE_USER, "un\xc9x", "joe", 0}});
-
     const char *line = "g\xa0staff\xa0rw";
     ASSERT_TRUE(kxtest::use_build_locale("kx_space.ISO-8859-1")) << "the test locale was not built";
     ASSERT_NE(std::isspace(no_break_space), 0);
     expect_line({line, 1, {SEC_ACLE_GROUP, "", "staff", 0x3}});
-    // A second separator leaves an empty token, which cannot stand for a
-    // mechanism or an identity.
+    // A second separator leaves an empty token.
     expect_line({"u unix\xa0\xa0joe", bad, {}, MSG_2650_172, {1}});
-
     ASSERT_NE(std::setlocale(LC_ALL, "C"), nullptr);
     expect_line({line, bad, {}, MSG_2650_179, {1, line}});
 }
-
 } // namespace

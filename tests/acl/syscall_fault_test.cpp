@@ -1,7 +1,6 @@
-// Every system call of sec_read_acl_file fails in turn, through the hook of
-// syscalls.h, on each way through it: the outcome is the one listed for
-// that call, no descriptor or temporary file is left, and the CACL file is
-// the one before or the new complete one. Leaks show in the sanitizer tree.
+// Every system call of sec_read_acl_file fails in turn on each way through
+// it: the listed outcome, no descriptor or temporary file left, and the
+// CACL file the one before or the new complete one.
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
@@ -16,7 +15,6 @@ namespace {
 
 constexpr int injected = EIO;
 
-// A failure with its record ("$" starts the directory), or success with rflags.
 struct outcome {
     kx_int32_t status, msg;
     kx_uint32_t rflags;
@@ -28,11 +26,9 @@ outcome fails(kx_int32_t status, int msg, std::vector<arg> args) {
 outcome gives(kx_uint32_t rflags) {
     return {SEC_S_OK, 0, rflags, {}};
 }
-
 enum class cacl_before { absent, stale, current };
 
-// The outcome of each call of each kind in the order made (a kind not
-// listed is not called).
+// The outcome of each call of each kind in order (a kind not listed is not called).
 using fault_rows = std::map<sys_call, std::vector<outcome>>;
 struct read_path {
     const char *what;
@@ -41,17 +37,11 @@ struct read_path {
     bool relative;
     fault_rows calls;
 };
-
-const char *const kind_names[] = {"open",   "read",   "write",  "close",  "stat",
-                                  "lstat",  "fstat",  "fchown", "fchmod", "rename",
-                                  "unlink", "getcwd", "fcntl"};
-
 int open_descriptors() {
     auto fds = std::filesystem::directory_iterator("/proc/self/fd");
     return static_cast<int>(std::distance(begin(fds), end(fds)));
 }
 
-// The ACL file and the CACL file the read starts from.
 struct prepared {
     acl_dir d;
     std::string compiled = acl_read(d.acl, TEXT).bytes();
@@ -63,7 +53,6 @@ struct prepared {
         write_file(d.cacl, cacl_bytes);
         shift_mtime(d.cacl, cacl == cacl_before::current ? 0 : -20);
     }
-    // Nothing left but the two files, the CACL file as it was or the new one.
     void expect_files_left(bool written) const {
         std::string cacl = read_file(d.cacl);
         EXPECT_EQ(cacl, written ? compiled : cacl_bytes);
@@ -103,15 +92,14 @@ bool read_failing(const prepared &p, const std::string &name, kx_uint32_t flags,
     return true;
 }
 
-// Fails every call once, on files prepared afresh each time.
 void fail_each_call(const read_path &path) {
     for (int k = 0; k <= static_cast<int>(sys_call::fcntl); ++k) {
         auto row = path.calls.find(static_cast<sys_call>(k));
         std::size_t listed = row == path.calls.end() ? 0 : row->second.size(), n = 0;
         for (;; ++n) {
-            SCOPED_TRACE(path.what + std::string(": ") + kind_names[k] + " " + std::to_string(n));
+            SCOPED_TRACE(path.what + std::string(": kind ") + std::to_string(k) + " call " +
+                         std::to_string(n));
             prepared p(path.cacl);
-            // A relative name joins the working directory as getcwd gives it.
             std::string dir = p.d.dir;
             if (path.relative) {
                 EXPECT_EQ(chdir(dir.c_str()), 0);
@@ -122,10 +110,9 @@ void fail_each_call(const read_path &path) {
                               n < listed ? &row->second[n] : nullptr, dir))
                 break;
         }
-        EXPECT_EQ(n, listed) << path.what << ": calls of " << kind_names[k];
+        EXPECT_EQ(n, listed) << path.what << ": calls of kind " << k;
     }
 }
-
 const long long text_size = static_cast<long long>(std::strlen(example_text));
 const outcome text_only = gives(TEXT), text_cached = gives(TEXT | CACHE);
 const outcome no_file = fails(SEC_S_NO_ACL_FILE, MSG_2650_135, {"$/acl", injected}),
@@ -174,7 +161,6 @@ TEST(SyscallFailure, EachCallFailingOrMovingHalfTheBytes) {
     // clang-format on
     for (const read_path &path : paths)
         fail_each_call(path);
-
     // A read or a write that moves half the bytes: the read fails showing
     // the bytes it got; the write leaves the read uncached.
     prepared p(cacl_before::absent);
@@ -182,5 +168,4 @@ TEST(SyscallFailure, EachCallFailingOrMovingHalfTheBytes) {
     EXPECT_TRUE(read_failing(p, p.d.acl, CACHE, sys_call::read, 0, 0, &half_read, p.d.dir));
     EXPECT_TRUE(read_failing(p, p.d.acl, CACHE, sys_call::write, 0, 0, &text_only, p.d.dir));
 }
-
 } // namespace
