@@ -429,4 +429,15 @@ TEST(ApiTrace, PerfLevelIsAnnouncedAtRegistration) {
     ASSERT_EQ(trace_ids(file), (std::vector<unsigned>{0}));
     EXPECT_EQ(read_trace(file)[0].items, (std::vector<std::string>{i32(2)}));
 }
+// A registration that the trace library refuses leaves the caller's record.
+TEST(ApiTrace, FailedRegistrationKeepsTheCallersRecord) {
+    static tr_detail_level_t levels[1];
+    static const tr_category_description_t cats[1] = {{0, "Other", 0, 0}};
+    ASSERT_EQ(tr_register_component_1("_SEL", levels, cats, 1), TR_OK);
+    bad_param("caller", 7, 0x1234u);
+    kx_uint32_t mask;
+    EXPECT_EQ(sec_translate_perms("r", nullptr, &mask), SEC_S_OK);
+    EXPECT_TRUE(record_is(SEC_S_BAD_PARAM, MSG_2650_101, {"caller", 7, 0x1234}));
+}
+
 } // namespace

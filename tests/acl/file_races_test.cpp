@@ -1,6 +1,7 @@
 // Texts read through a window of whole lines; names flipped between steps.
 #include <algorithm>
 #include <cerrno>
+#include <sys/wait.h>
 #include <tuple>
 
 #include "file_helpers.h"
@@ -175,6 +176,31 @@ TEST(ReadAclFileRaces, NameGivenToAnotherFileBetweenTheReadersSteps) {
         for (const auto &n : dir_entries(files.d.dir))
             EXPECT_TRUE(n == "acl" || n == "acl.cacl" || n == "mine" || n == "theirs") << n;
     }
+}
+
+// A daemon without a controlling terminal opens a terminal swapped in for
+// its ACL file without acquiring it, and refuses it.
+TEST(ReadAclFileRaces, TerminalSwappedInIsNeitherAcquiredNorRead) {
+    acl_dir d;
+    pid_t pid = fork();
+    if (pid == 0) {
+        int master = posix_openpt(O_RDWR | O_NOCTTY);
+        std::string staged = d.dir + "/tty";
+        if (setsid() < 0 || master < 0 || grantpt(master) != 0 || unlockpt(master) != 0 ||
+            symlink(ptsname(master), staged.c_str()) != 0)
+            _exit(10);
+        std::function<void()> swap = [&] { rename(staged.c_str(), d.acl.c_str()); };
+        flip_before(sys_call::open, 0, &swap);
+        acl_read r(d.acl, TEXT);
+        if (!sys_fault_fired() || r.status != SEC_S_NO_ACL_FILE)
+            _exit(12);
+        // Without a controlling terminal, there is none to open.
+        _exit(open("/dev/tty", O_RDONLY | O_NOCTTY) < 0 ? 0 : 13);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0);
 }
 
 } // namespace

@@ -172,4 +172,42 @@ TEST_F(MessageTest, CatalogueTextReplacesTheDefault) {
     unsetenv("NLSPATH");
 }
 
+TEST_F(ErrorRecordTest, RecordsHoldCopiesOfTheCallersData) {
+    char ffdc[] = "ffdc", cat[] = "c.cat", text[] = "%1$s %2$d", name[] = "alice";
+    cu_error_arg_t args[2] = {};
+    args[0].cu_arg_type = CU_ERROR_ARG_CHAR_STR;
+    args[0].cu_arg_value.cu_arg_char_str = name;
+    args[1].cu_arg_value.cu_arg_int = 17;
+    const cu_error_t mine = {7, ffdc, cat, 1, 2, text, 2, args};
+    const std::string expected = R"(7 "ffdc" "c.cat" 1.2 "%1$s %2$d" [s"alice" i17])";
+    auto spoil = [&] { // twice restores
+        for (char *s : {ffdc, cat, text, name})
+            s[0] ^= 1;
+        args[1].cu_arg_value.cu_arg_int ^= 1;
+    };
+    ASSERT_EQ(cu_set_error_1(7, ffdc, cat, 1, 2, text, name, 17), 0);
+    spoil();
+    EXPECT_EQ(current_record(), expected);
+    spoil();
+    ASSERT_EQ(cu_pset_error_1(&mine), 0);
+    spoil();
+    EXPECT_EQ(current_record(), expected);
+}
+
+// A cleared record's block holds the next record that fits: nothing of the
+// old one may show through, and a larger one gets a block of its own.
+TEST_F(ErrorRecordTest, CopiesOutliveRecordsAndClearedBlocksHoldWholeRecords) {
+    const std::string long_text(200, 'L'), longer(1000, 'M');
+    ASSERT_EQ(cu_set_error_1(1, "ffdc", "cat", 1, 2, "%1$s %2$s", long_text.c_str(), "b"), 0);
+    const unique_error first = current_error();
+    cu_set_no_error_1();
+    EXPECT_EQ(current_record(), no_error);
+    ASSERT_EQ(cu_set_error_1(3, nullptr, nullptr, 0, 4, "short %1$d", 9), 0);
+    EXPECT_EQ(current_record(), R"(3 NULL NULL 0.4 "short %1$d" [i9])");
+    ASSERT_EQ(cu_set_error_1(5, nullptr, nullptr, 0, 6, "%1$s", longer.c_str()), 0);
+    EXPECT_EQ(current_record(), "5 NULL NULL 0.6 \"%1$s\" [s\"" + longer + "\"]");
+    EXPECT_EQ(describe(first.get()),
+              "1 \"ffdc\" \"cat\" 1.2 \"%1$s %2$s\" [s\"" + long_text + "\" s\"b\"]");
+}
+
 } // namespace

@@ -6,10 +6,13 @@
 
 #include <cstdint>
 #include <string>
+#include <tuple>
 #include <utility>
 #include <vector>
 
 #include <kx_cu.h>
+
+#include "posix_case.h"
 
 namespace {
 
@@ -144,6 +147,45 @@ TEST(TimebaseTest, CounterIsTheMonotonicClockInNanosecondsAndConverts) {
     info = {1000, 0};
     cu_cvt_time_1(2500, &info, &got.first, nullptr);
     EXPECT_EQ(got.first, 2);
+}
+
+// The word-at-a-time forms of posix_case.h around the word size: a
+// difference or a NUL on either side of the eighth byte, case folded past
+// it, bytes at the edges of the folding range. Each text is followed by its
+// NUL and, in some rows, bytes that do not count, in a block of exactly that
+// size.
+TEST(PosixCaseWords, OrderLikeTheExportedComparison) {
+    namespace pc = kx::posix_case;
+    const struct {
+        std::string a, b;
+        int want;
+    } cases[] = {
+        // clang-format off
+        {"ABCDEFGHij", "abcdefghIJ", 0}, {"abcdefg", "ABCDEFG", 0}, {"", "", 0},
+        {"abcdefgh", "abcdefgi", -1}, {"abcdefgh", "abcdefg", 1}, {"", "a", -1},
+        {"abcdefghIjklmnopq", "ABCDEFGHijklmnopqR", -1}, {"@@@@@@@@a", "````````A", -1},
+        {"[[[[[[[[a", "{{{{{{{{A", -1}, {"ZzZzZzZzZ", "zZzZzZzZz", 0},
+        {"Zzzzzzzz\xc1", "zZZZZZZZ\xe1", -1}, {"\xc1", "\xe1", -1}, {"\x80\xff", "\x7f", 1},
+        {"x\x5b", "X\x7b", -1}, {"abc", "ABC", 0},
+        // clang-format on
+    };
+    for (const auto &c : cases) {
+        for (const auto &[a, b, want] : {std::tuple{c.a, c.b, c.want}, {c.b, c.a, -c.want}}) {
+            const std::size_t sa = a.size() + 1, sb = b.size() + 1;
+            std::vector<char> ta(a.c_str(), a.c_str() + sa), tb(b.c_str(), b.c_str() + sb);
+            ta.insert(ta.end(), {'Q', '\x01', '@'});
+            tb.insert(tb.end(), a.size() % 2 ? 9 : 0, '\xff'); // short blocks too
+            SCOPED_TRACE(a + " | " + b);
+            EXPECT_EQ(sign(cu_strcasecmp_posix_1(a.c_str(), b.c_str())), want);
+            EXPECT_EQ(sign(pc::compare(ta.data(), ta.size(), tb.data(), tb.size())), want);
+            EXPECT_EQ(sign(pc::prepared_text(a.c_str(), sa).order(tb.data(), tb.size())), want);
+            EXPECT_EQ(pc::folded_hash(a.c_str(), sa) == pc::folded_hash(b.c_str(), sb), want == 0);
+            // Keys that differ order the texts; equal keys of a text that
+            // ends within them mean equal texts.
+            const std::uint64_t ka = pc::sort_key(a.c_str(), sa), kb = pc::sort_key(b.c_str(), sb);
+            EXPECT_TRUE(ka != kb ? (ka < kb ? -1 : 1) == want : want == 0 || (sa > 8 && sb > 8));
+        }
+    }
 }
 
 } // namespace

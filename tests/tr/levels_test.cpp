@@ -128,4 +128,14 @@ TEST_F(Levels, RegistrationRules) {
     EXPECT_EQ(level, 4);
 }
 
+// A setting far longer than any buffer is read to its end.
+TEST_F(Levels, OverlongConfigurationIsReadToItsEnd) {
+    std::string overlong = "_TST:";
+    for (int i = 0; i < 20000; ++i)
+        overlong += "Unknown=1,";
+    setenv("KX_TRACE_LEVELS", (overlong + "API=6").c_str(), 1);
+    ASSERT_EQ(register_as("_TST", levels), TR_OK);
+    EXPECT_EQ(levels, (levels_t{0, 6, 3, 9, 4}));
+}
+
 } // namespace

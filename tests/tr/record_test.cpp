@@ -14,6 +14,7 @@
 #include <string>
 #include <thread>
 #include <tuple>
+#include <utility>
 #include <vector>
 
 #include <sys/stat.h>
@@ -183,6 +184,42 @@ TEST(Unrecorded, RecordsAreDroppedOrFailWithoutWaiting) {
             << (c.file ? c.file : "no KX_TRACE_FILE");
         EXPECT_TRUE(std::filesystem::is_empty(work));
     }
+}
+
+// Records count items of 16 bytes, the i-th at bytes + 16 * i.
+template <std::size_t... I>
+int record_16_byte_items(const unsigned char *bytes, kx_uint32_t count, std::index_sequence<I...>) {
+    auto pairs =
+        std::tuple_cat(std::make_tuple(static_cast<const void *>(bytes + 16 * I), u32(16))...);
+    return std::apply([&](auto... pair) { return tr_record_data_1("_TST", 64, count, pair...); },
+                      pairs);
+}
+
+// Item sizes across the point where a record outgrows the stack buffer,
+// every byte value (i * 7 + 3 runs through all 256), and the most items a
+// record takes.
+TEST_F(Records, ItemsOfAnySizeAndCountAreWrittenWhole) {
+    std::vector<unsigned char> bytes(6000);
+    for (std::size_t i = 0; i < bytes.size(); ++i)
+        bytes[i] = static_cast<unsigned char>(i * 7 + 3);
+    std::vector<kx_uint32_t> lengths = {256, 6000};
+    for (kx_uint32_t n = 440; n < 520; ++n)
+        lengths.push_back(n);
+    for (kx_uint32_t n : lengths)
+        ASSERT_EQ(tr_record_data_1("_TST", n, 2, bytes.data(), n, "z", u32(2)), TR_OK);
+    EXPECT_EQ(record_16_byte_items(bytes.data(), 64, std::make_index_sequence<64>()), TR_OK);
+    EXPECT_EQ(record_16_byte_items(bytes.data(), 65, std::make_index_sequence<65>()),
+              TR_BAD_ARGUMENT);
+    EXPECT_EQ(tr_record_data_1("_TST", 1, UINT32_MAX), TR_BAD_ARGUMENT); // reads no argument
+
+    const auto r = read_trace_lines(trace);
+    ASSERT_EQ(r.size(), lengths.size() + 1);
+    for (std::size_t i = 0; i < lengths.size(); ++i)
+        EXPECT_EQ(r[i].items, (strings{trace_item(bytes.data(), lengths[i]), "7a00"}))
+            << lengths[i];
+    ASSERT_EQ(r.back().items.size(), 64u);
+    for (std::size_t i = 0; i < 64; ++i)
+        EXPECT_EQ(r.back().items[i], trace_item(&bytes[16 * i], 16)) << i;
 }
 
 } // namespace
