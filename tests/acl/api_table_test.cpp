@@ -277,7 +277,7 @@ struct world {
     entry carol{SEC_ACLE_USER, 7, "unix", "carol"};
     acl_dir dir{"o r\n# c\ng staff rw\n"};
     kx_uint32_t perm = 0, rflags = 0;
-    char text[33] = {}, staff[6] = "staff";
+    char text[33] = {}, staff[6] = "staff", unix_mech[5] = "unix";
     sec_buffer_s groups[1] = {{6, staff}};
     char *mech = nullptr, *id = nullptr;
     ~world() {
@@ -346,10 +346,18 @@ std::vector<traced_call> traced_calls() {
              x.at(24, {i32(71), ptr(w.acl.d.value), ptr(w.list.get())});
              x.at(27, {i32(ok), i32(3)});
              return sec_list_acl(w.acl.get(), w.list.get()); }},
+        // A null ACL has entry points of its own, and the failure's exit.
+        {"sec_list_acl of no ACL", 20, 25, clears, [](world &w, expected &x) {
+             x.at(22, {ptr(nullptr), ptr(w.typed.get())}), x.at(26, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl(nullptr, w.typed.get()); }},
         {"sec_list_acl_by_type", 28, 33, clears, [](world &w, expected &x) {
              x.at(32, {i32(71), ptr(w.acl.d.value), u32(16), txt(""), ptr(w.typed.get())});
              x.at(35, {i32(ok), i32(1)});
              return sec_list_acl_by_type(w.acl.get(), SEC_ACLE_GROUP, nullptr, w.typed.get()); }},
+        {"sec_list_acl_by_type of no ACL", 28, 33, clears, [](world &w, expected &x) {
+             x.at(30, {ptr(nullptr), u32(4), txt("unix"), ptr(w.list.get())});
+             x.at(34, {i32(SEC_S_BAD_PARAM)});
+             return sec_list_acl_by_type(nullptr, SEC_ACLE_USER, w.unix_mech, w.list.get()); }},
         {"sec_release_aclelist", 36, 39, release, [](world &w, expected &x) {
              x.at(38, {ptr(w.list.get()), i32(3)}), x.at(39);
              sec_release_aclelist(w.list.get());
