@@ -34,6 +34,22 @@ TEST(MessageTable, FixedEntriesAndNumberedMessages) {
 }
 
 // Pointers show their low 32 bits; huge byte counts do not wrap.
+// The scan by which reports are checked against their message at compile
+// time: numbered conversions with flags, "%%", unnumbered conversions (not
+// counted), and numbers that a text skips (integers).
+TEST(MessageTable, PlaceholderCounts) {
+    EXPECT_EQ(placeholder_count("none: 100%%1$s sure, %d %s"), 0);
+    const char *text = "%%%4$#x %2$s at %1$08x, %3$-4d";
+    EXPECT_EQ(placeholder_count(text), 4);
+    EXPECT_EQ(placeholder_kind(text, 1), arg_kind::integer);
+    EXPECT_EQ(placeholder_kind(text, 2), arg_kind::text);
+    EXPECT_EQ(placeholder_kind(text, 5), arg_kind::none);
+    // 2650-126 and 2650-127 start at their second placeholder.
+    EXPECT_EQ(placeholder_count(message_text(MSG_2650_127)), 3);
+    EXPECT_EQ(placeholder_kind(message_text(MSG_2650_126), 1), arg_kind::integer);
+    EXPECT_EQ(placeholder_kind(message_text(MSG_2650_127), 2), arg_kind::text);
+}
+
 TEST(Report, FillsTheRecordAsTheCatalogueExpects) {
     int x = 0;
     EXPECT_EQ(bad_param("sec_list_acl", 2, static_cast<void *>(nullptr)), SEC_S_BAD_PARAM);
