@@ -186,9 +186,7 @@ TEST_F(KxaclTool, ReadingCommandsPrintExactlyAndExitByTheirAnswer) {
               "anyother: r 0x00000001\n  decided by line 4: o r\n"
               "unauthenticated: - 0x00000000\n  decided by line 3: n\n"),
         gives(
-            {"explain", acl, "--json", "--user", "unix", "nobody", "--expanded", "unix", "joe",
-             "--group", "zzz", "staff"},
-            0,
+            {"explain", acl, "--json", "--user", "unix", "nobody", "--expanded", "unix", "joe"}, 0,
             R"({"file":")" + acl +
                 R"j(","source":"text","answers":[{"question":"user","mech":)j"
                 R"j("unix","ids":["nobody"],"entry":false,"perms":"","mask":0,"decided_by":null,)j"
